@@ -1,0 +1,57 @@
+#include "app/localtime_link.h"
+
+#include "fsutil/fsutil.h"
+#include "paths.h"
+
+#include <cstdio>
+#include <string>
+#include <string_view>
+
+#include <err.h>
+
+namespace
+{
+
+constexpr char default_zone[] = "America/Los_Angeles";
+constexpr char default_zone_path[] = "/var/db/timezone/zoneinfo/America/Los_Angeles";
+
+void replace_localtime_link(const std::string& target)
+{
+    // Of no interest: what could not be deleted fails the creation, which reports it.
+    std::remove(paths::localtime_link);
+    fsutil::create_symlink(target, paths::localtime_link);
+}
+
+/// Throws whenever the link can be neither kept nor corrected.
+void keep_or_correct_localtime_link()
+{
+    constexpr int invalid_link = -1;
+    constexpr std::string_view correctable = paths::read_only_zoneinfo;
+
+    const std::string zone_path = fsutil::read_symlink(paths::localtime_link);
+    if (zone_path.starts_with(paths::zoneinfo_link)) {
+        return;
+    }
+    if (!zone_path.starts_with(correctable)) {
+        throw invalid_link;
+    }
+    const std::string corrected = paths::zoneinfo_link + zone_path.substr(correctable.size());
+    // Told before the zone is looked for: a correction that fails is seen to have been tried.
+    warn("Correcting localtime link to %s", corrected.c_str());
+    if (!fsutil::exists(corrected)) {
+        throw invalid_link;
+    }
+    replace_localtime_link(corrected);
+}
+
+} // namespace
+
+void repair_localtime_link()
+{
+    try {
+        keep_or_correct_localtime_link();
+    } catch (...) {
+        warn("localtime link invalid; resetting to %s", default_zone);
+        replace_localtime_link(default_zone_path);
+    }
+}

@@ -1,0 +1,19 @@
+#include "app/console.h"
+#include "app/localtime_link.h"
+#include "app/timezone_directories.h"
+#include "paths.h"
+
+#include <cstdio>
+
+int main()
+try {
+    prepare_console();
+    prepare_timezone_directories();
+    std::remove(paths::cleanup_marker);
+    std::remove(paths::stale_icu);
+    repair_localtime_link();
+    return 0;
+} catch (...) {
+    // What failed has been reported, and nothing is left to fall back to.
+    return 1;
+}

@@ -1,0 +1,23 @@
+#include "app/timezone_directories.h"
+
+#include "paths.h"
+#include "platform/data_protection.h"
+
+#include <unistd.h>
+
+void prepare_timezone_directories()
+{
+    set_directory_protection_class(paths::timezone_directory);
+    set_directory_protection_class(paths::dataset_root);
+}
+
+void set_directory_protection_class(const char* path)
+{
+    const int directory = ::open(path, O_RDONLY | O_CLOEXEC);
+    if (directory == -1) {
+        return;
+    }
+    // A class that cannot be set must not keep the device from its time zone: results are ignored.
+    ::fcntl(directory, F_SETPROTECTIONCLASS, 4);
+    ::close(directory);
+}

@@ -1,0 +1,31 @@
+#pragma once
+
+#include <string>
+
+/// The link operations that everything else is built on, each a thin cover of one system call.
+///
+/// A failure has one shape: a single warning that names the operation and the path, then the
+/// `errno` of the failed call thrown as an `int`. A failed call has changed nothing on disk.
+namespace fsutil
+{
+
+/// Removes the file or link at `path` (a link itself, never what it points at; never a directory).
+/// A missing path is no failure.
+/// Any other failure warns "remove: could not remove %s" and throws.
+void remove(const std::string& path);
+
+/// Returns whether something exists at `path`, with links followed: false for a dangling link, and
+/// for whatever cannot be examined. Neither warns nor throws.
+bool exists(const std::string& path);
+
+/// Returns the text of the link at `path`, unresolved and cut to its first 1,024 bytes; the empty
+/// text when the path is missing.
+/// Any other failure, such as a path that is no link, warns "read_symlink: %s" and throws.
+std::string read_symlink(const std::string& path);
+
+/// Creates a link at `link_path` with the text `target`, which need not exist.
+/// Any failure, such as an entry that already exists at `link_path`, warns
+/// "create_symlink: from %s to %s" (link path, then target) and throws.
+void create_symlink(const std::string& target, const std::string& link_path);
+
+} // namespace fsutil

@@ -1,0 +1,28 @@
+#pragma once
+
+/// The system's paths, all of them, with the names that the system uses for them. They are compiled
+/// in: there is no option, variable or file that changes one.
+namespace paths
+{
+
+// The read-only system partition.
+inline constexpr char system_zoneinfo[] = "/usr/share/zoneinfo.default";
+inline constexpr char system_icu[] = "/usr/share/icu";
+inline constexpr char read_only_zoneinfo[] = "/usr/share/zoneinfo";
+
+// Where updated datasets are installed, each in a directory named by its version text.
+inline constexpr char timezone_directory[] = "/var/db/timezone/";
+inline constexpr char dataset_root[] = "/var/db/timezone/tz/";
+inline constexpr char latest_link[] = "/var/db/timezone/tz_latest";
+
+// What the rest of the system reads time-zone data through.
+inline constexpr char zoneinfo_link[] = "/var/db/timezone/zoneinfo";
+inline constexpr char icu_link[] = "/var/db/icutz";
+inline constexpr char localtime_link[] = "/var/db/timezone/localtime";
+
+// What a run leaves for other programs, and what it only ever deletes.
+inline constexpr char cleanup_marker[] = "/var/db/timezone/needs_cleanup";
+inline constexpr char version_record[] = "/var/db/timezone/TZVersionDiffRecord";
+inline constexpr char stale_icu[] = "/var/db/icu";
+
+} // namespace paths
