@@ -1,0 +1,33 @@
+#pragma once
+
+#include "components/mira_dataset_component.h"
+
+#include <string>
+
+/// A compiled tz database tree: "/usr/share/zoneinfo.default" in the system dataset, the
+/// subdirectory "zoneinfo" of an updated dataset.
+class mira_zoneinfo final : public mira_dataset_component
+{
+public:
+    /// Builds the component of the dataset in the directory `dataset_path`; the empty path is the
+    /// system dataset. A missing tree is no failure.
+    explicit mira_zoneinfo(const std::string& dataset_path = {});
+
+    /// Returns the tree's version text: the first word of its file "+VERSION", whatever the word
+    /// holds; empty when the file cannot be read or holds no word.
+    std::string version_string() const { return version_string_; }
+
+    /// Returns true for every other component: whether datasets fit is for the ICU data to say.
+    bool compatible_schema(const mira_dataset_component& other) const override;
+
+    /// Points "/var/db/timezone/zoneinfo" at the tree, which need not exist. A link that cannot be
+    /// removed warns "Unlink of zoneinfo softlink failed", after the warning of `fsutil::remove`,
+    /// and creating the new one is tried all the same.
+    void make_current() const override;
+
+private:
+    void read_version();
+
+    std::string zoneinfo_path_;
+    std::string version_string_;
+};
