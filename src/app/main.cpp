@@ -1,9 +1,12 @@
 #include "app/console.h"
+#include "app/dataset_selection.h"
 #include "app/localtime_link.h"
 #include "app/timezone_directories.h"
 #include "paths.h"
 
 #include <cstdio>
+
+#include <err.h>
 
 int main()
 try {
@@ -11,6 +14,12 @@ try {
     prepare_timezone_directories();
     std::remove(paths::cleanup_marker);
     std::remove(paths::stale_icu);
+    try {
+        select_dataset();
+    } catch (...) {
+        warn("Unable to locate data; resetting to system partition");
+        reset_to_system_partition();
+    }
     repair_localtime_link();
     return 0;
 } catch (...) {
