@@ -1,5 +1,5 @@
 #include "fsutil/fsutil.h"
-#include "support/observe.h"
+#include "support/run.h"
 
 #include <algorithm>
 #include <cerrno>
@@ -10,113 +10,79 @@
 namespace
 {
 
-using fsutil_on = device;
+using links = device;
 
-const std::string base = "/var/db/";
-const std::string missing = base + "missing";
+void check_failure(int error, const std::string& warning, const std::function<void()>& action)
+{
+    check_action(action, {failed(warning, error)}, error);
+}
 
 } // namespace
 
-TEST_F(fsutil_on, remove_takes_the_entry_and_never_what_it_points_at)
+TEST_F(links, are_removed_and_not_what_they_point_at)
 {
-    make_file(base + "file");
-    make_link(base + "link", base + "file");
-    make_link(base + "dangling", missing);
-    check_action([] {
-        fsutil::remove(base + "link");
-        fsutil::remove(base + "dangling");
-        fsutil::remove(missing);
-    });
-    check_nothing_at(base + "link");
-    check_nothing_at(base + "dangling");
-    check_file(base + "file", "");
-}
-
-TEST_F(fsutil_on, remove_throws_eisdir_and_enotdir)
-{
-    make_file(base + "file");
-    const std::string message = "remove: could not remove ";
-    check_action(
-        [] { fsutil::remove("/var/db"); }, {failed(message + "/var/db", EISDIR)},
-        "int " + std::to_string(EISDIR)
-    );
-    check_action(
-        [] { fsutil::remove(base + "file/x"); }, {failed(message + base + "file/x", ENOTDIR)},
-        "int " + std::to_string(ENOTDIR)
-    );
-}
-
-TEST_F(fsutil_on, exists_follows_links)
-{
-    make_file(base + "file", "", 0);
-    make_link(base + "link", base + "file");
-    make_link(base + "dangling", missing);
-    check_action([] {
-        EXPECT_TRUE(fsutil::exists(base));
-        EXPECT_TRUE(fsutil::exists(base + "file"));
-        EXPECT_TRUE(fsutil::exists(base + "link"));
-        EXPECT_FALSE(fsutil::exists(base + "dangling"));
-        EXPECT_FALSE(fsutil::exists(missing));
-        EXPECT_FALSE(fsutil::exists(base + "file/x"));
-    });
-}
-
-TEST_F(fsutil_on, read_symlink_cuts_the_text_at_1024_bytes)
-{
-    const std::string link = base + "link";
-    for (const std::size_t length : {1U, 1023U, 1024U, 1025U, 1030U}) {
-        make_link(link, std::string(length, 'x'));
-        const std::string expected(std::min<std::size_t>(length, 1024), 'x');
-        check_action([&] { EXPECT_EQ(fsutil::read_symlink(link), expected); });
+    make_file("/var/file");
+    make_link("/var/link", "/var/file");
+    make_link("/var/dangling", "/var/missing");
+    for (const char* path : {"/var/link", "/var/dangling", "/var/missing"}) {
+        check_action([&] { fsutil::remove(path); });
+        check_nothing_at(path);
     }
-    check_action([] { EXPECT_EQ(fsutil::read_symlink(missing), ""); });
+    check_file("/var/file", "");
 }
 
-TEST_F(fsutil_on, read_symlink_throws_einval_and_enotdir)
+TEST_F(links, exist_when_they_lead_somewhere)
 {
-    make_file(base + "file");
-    check_action(
-        [] { fsutil::read_symlink(base + "file"); },
-        {failed("read_symlink: " + base + "file", EINVAL)}, "int " + std::to_string(EINVAL)
-    );
-    check_action(
-        [] { fsutil::read_symlink(base + "file/x"); },
-        {failed("read_symlink: " + base + "file/x", ENOTDIR)}, "int " + std::to_string(ENOTDIR)
-    );
-}
-
-TEST_F(fsutil_on, create_symlink_does_not_look_at_the_target)
-{
-    check_action([] { fsutil::create_symlink("no such target", base + "link"); });
-    check_link(base + "link", "no such target");
-}
-
-TEST_F(fsutil_on, create_symlink_throws_eexist_and_enoent)
-{
-    make_link(base + "link", "old");
-    const std::string message = "create_symlink: from ";
-    check_action(
-        [] { fsutil::create_symlink("new", base + "link"); },
-        {failed(message + base + "link to new", EEXIST)}, "int " + std::to_string(EEXIST)
-    );
-    check_link(base + "link", "old");
-    check_action(
-        [] { fsutil::create_symlink("new", missing + "/link"); },
-        {failed(message + missing + "/link to new", ENOENT)}, "int " + std::to_string(ENOENT)
-    );
-}
-
-TEST_F(fsutil_on, what_is_thrown_is_the_errno_of_the_call_when_the_warning_cannot_be_written)
-{
+    make_file("/var/file", "", 0);
+    make_link("/var/link", "/var/file");
+    make_link("/var/dangling", "/var/missing");
     check_action([] {
-        const int standard_error = ::dup(STDERR_FILENO);
-        ::close(STDERR_FILENO);
-        try {
-            fsutil::remove("/var/db");
-        } catch (int error) {
-            EXPECT_EQ(error, EISDIR);
-        }
-        ::dup2(standard_error, STDERR_FILENO);
-        ::close(standard_error);
+        EXPECT_TRUE(fsutil::exists("/var/db") && fsutil::exists("/var/link"));
+        EXPECT_FALSE(fsutil::exists("/var/dangling") || fsutil::exists("/var/file/x"));
     });
+}
+
+TEST_F(links, are_read_up_to_1024_bytes)
+{
+    for (const std::size_t length : {1U, 1023U, 1024U, 1025U, 1030U}) {
+        make_link("/var/link", std::string(length, 'x'));
+        const std::string text(std::min<std::size_t>(length, 1024), 'x');
+        check_action([&] { EXPECT_EQ(fsutil::read_symlink("/var/link"), text); });
+    }
+    check_action([] { EXPECT_EQ(fsutil::read_symlink("/var/missing"), ""); });
+}
+
+TEST_F(links, fail_with_the_errno_of_the_call)
+{
+    make_file("/var/file");
+    make_link("/var/link", "old");
+    const std::string remove = "remove: could not remove ";
+    check_failure(EISDIR, remove + "/var/db", [] { fsutil::remove("/var/db"); });
+    check_failure(ENOTDIR, remove + "/var/file/x", [] { fsutil::remove("/var/file/x"); });
+
+    const std::string read = "read_symlink: ";
+    check_failure(EINVAL, read + "/var/file", [] { fsutil::read_symlink("/var/file"); });
+    check_failure(ENOTDIR, read + "/var/file/x", [] { fsutil::read_symlink("/var/file/x"); });
+
+    const std::string create = "create_symlink: from ";
+    check_failure(
+        EEXIST, create + "/var/link to new", [] { fsutil::create_symlink("new", "/var/link"); });
+    check_failure(ENOENT, create + "/var/missing/link to new",
+        [] { fsutil::create_symlink("new", "/var/missing/link"); });
+    check_link("/var/link", "old");
+}
+
+TEST_F(links, fail_with_the_errno_of_the_call_when_the_warning_cannot_be_written)
+{
+    for (const auto& [error, action] : std::initializer_list<std::pair<int, void (*)()>>{
+             {EISDIR, [] { fsutil::remove("/var/db"); }},
+             {EINVAL, [] { fsutil::read_symlink("/var/db"); }},
+             {EEXIST, [] { fsutil::create_symlink("new", "/var/db"); }}}) {
+        check_action(
+            [action = action] {
+                ::close(STDERR_FILENO);
+                action();
+            },
+            {}, error);
+    }
 }

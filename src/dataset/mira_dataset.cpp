@@ -36,10 +36,9 @@ void mira_dataset::create_components()
 
 bool mira_dataset::compatible_schema(const mira_dataset& other) const
 {
-    return std::equal(
-        components_.begin(), components_.end(), other.components_.begin(), other.components_.end(),
-        [](const auto& mine, const auto& theirs) { return mine->compatible_schema(*theirs); }
-    );
+    return std::equal(components_.begin(), components_.end(), other.components_.begin(),
+        other.components_.end(),
+        [](const auto& mine, const auto& theirs) { return mine->compatible_schema(*theirs); });
 }
 
 void mira_dataset::make_current() const

@@ -22,6 +22,5 @@ inline constexpr int F_SETPROTECTIONCLASS = 64;
 /// flags hold `O_CREAT`, the permission bits that follow as an `int`. Returns the descriptor, or -1
 /// with `errno` set. Here the class and the protection options have no effect.
 int open_dprotected_np(
-    const char* path, int flags, int protection_class, int protection_options, ...
-);
+    const char* path, int flags, int protection_class, int protection_options, ...);
 #endif

@@ -9,7 +9,6 @@
 #include <fstream>
 #include <iterator>
 
-#include <fcntl.h>
 #include <sched.h>
 #include <sys/mount.h>
 #include <sys/stat.h>
@@ -22,24 +21,19 @@ namespace
 
 constexpr const char* device_roots[] = {"/usr/share", "/var"};
 
-void write_proc_file(const char* path, const std::string& text)
+/// Enters a private mount namespace, as root of a user namespace where the caller is not root.
+/// Returns 0 or the errno of the refusal.
+int enter_namespace()
 {
-    std::ofstream(path) << text;
-}
-
-/// Enters a mount namespace of this process's own, as the root of a user namespace where the caller
-/// is not root already. Returns an errno, or 0.
-int enter_private_namespace()
-{
-    const uid_t user = ::geteuid();
-    const gid_t group = ::getegid();
-    if (::unshare(user == 0 ? CLONE_NEWNS : CLONE_NEWNS | CLONE_NEWUSER) != 0) {
+    const std::string user = std::to_string(::geteuid());
+    const std::string group = std::to_string(::getegid());
+    if (::unshare(user == "0" ? CLONE_NEWNS : CLONE_NEWNS | CLONE_NEWUSER) != 0) {
         return errno;
     }
-    if (user != 0) {
-        write_proc_file("/proc/self/setgroups", "deny");
-        write_proc_file("/proc/self/uid_map", "0 " + std::to_string(user) + " 1");
-        write_proc_file("/proc/self/gid_map", "0 " + std::to_string(group) + " 1");
+    if (user != "0") {
+        std::ofstream("/proc/self/setgroups") << "deny";
+        std::ofstream("/proc/self/uid_map") << "0 " + user + " 1";
+        std::ofstream("/proc/self/gid_map") << "0 " + group + " 1";
     }
     return ::mount(nullptr, "/", nullptr, MS_REC | MS_PRIVATE, nullptr) == 0 ? 0 : errno;
 }
@@ -48,15 +42,11 @@ int enter_private_namespace()
 
 void device::SetUp()
 {
-    static const int refused = enter_private_namespace();
-    if (refused != 0) {
-        const std::string reason =
-            std::string("the kernel refuses a private mount namespace: ") + std::strerror(refused);
-        if (std::getenv("CI") != nullptr) {
-            FAIL() << reason;
-        }
-        GTEST_SKIP() << reason;
+    static const int refusal = enter_namespace();
+    if (refusal != 0 && std::getenv("CI") == nullptr) {
+        GTEST_SKIP() << "the kernel refuses a mount namespace: " << std::strerror(refusal);
     }
+    ASSERT_EQ(refusal, 0) << std::strerror(refusal);
     for (const char* root : device_roots) {
         ASSERT_EQ(::mount("tmpfs", root, "tmpfs", 0, "mode=0755"), 0) << std::strerror(errno);
     }
@@ -73,9 +63,10 @@ void device::TearDown()
 
 void make_file(const std::string& path, const std::string& content, mode_t mode)
 {
+    remove_all(path);
     make_directory(fs::path(path).parent_path());
     std::ofstream(path, std::ios::binary) << content;
-    ASSERT_EQ(::chmod(path.c_str(), mode), 0) << path;
+    fs::permissions(path, fs::perms(mode));
 }
 
 void make_directory(const std::string& path)
@@ -85,32 +76,41 @@ void make_directory(const std::string& path)
 
 void make_link(const std::string& path, const std::string& text)
 {
-    fs::remove(path);
+    remove_all(path);
     fs::create_symlink(text, path);
+}
+
+void remove_all(const std::string& path)
+{
+    fs::remove_all(path);
 }
 
 void install_system(const std::string& version, const std::string& format)
 {
-    const std::string tree = paths::system_zoneinfo;
-    make_file(tree + "/+VERSION", version + "\n");
-    make_file(tree + "/America/Los_Angeles");
-    make_file(tree + "/Asia/Tokyo");
-    make_file(std::string(paths::system_icu) + "/icutzformat.txt", format + "\n");
+    make_file("/usr/share/zoneinfo.default/+VERSION", version + "\n");
+    make_file("/usr/share/zoneinfo.default/Asia/Tokyo");
+    make_file("/usr/share/icu/icutzformat.txt", format + "\n");
 }
 
 std::string install_update(const std::string& version, const std::string& format)
 {
-    std::string directory = paths::dataset_root + version;
-    make_file(directory + "/zoneinfo/America/Los_Angeles");
+    std::string directory = "/var/db/timezone/tz/" + version;
+    make_directory(directory + "/zoneinfo");
     if (!format.empty()) {
         make_file(directory + "/icutz/icutz" + format + ".dat");
     }
     return directory;
 }
 
-void make_read_only(const std::string& root)
+void link_data(const std::string& dataset)
 {
-    ASSERT_EQ(::mount(nullptr, root.c_str(), nullptr, MS_REMOUNT | MS_RDONLY, nullptr), 0);
+    remove_all(paths::icu_link);
+    if (dataset.empty()) {
+        make_link(paths::zoneinfo_link, "/usr/share/zoneinfo.default");
+    } else {
+        make_link(paths::zoneinfo_link, dataset + "/zoneinfo");
+        make_link(paths::icu_link, dataset + "/icutz");
+    }
 }
 
 void check_link(const std::string& path, const std::string& text)
@@ -131,10 +131,10 @@ void check_nothing_at(const std::string& path)
     EXPECT_FALSE(fs::exists(fs::symlink_status(path))) << path;
 }
 
-void check_current(const std::string& dataset)
+void check_data_links(const std::string& dataset)
 {
     if (dataset.empty()) {
-        check_link(paths::zoneinfo_link, paths::system_zoneinfo);
+        check_link(paths::zoneinfo_link, "/usr/share/zoneinfo.default");
         check_nothing_at(paths::icu_link);
     } else {
         check_link(paths::zoneinfo_link, dataset + "/zoneinfo");

@@ -1,0 +1,45 @@
+#pragma once
+
+#include "support/device.h"
+
+#include <functional>
+#include <string>
+
+/// Returns the line of a warning about a call that has just failed with `error`. A line without an
+/// errno's text is expected with any: where no call has just failed, what stands there is left
+/// over from an earlier one.
+std::string failed(const std::string& warning, int error);
+/// Returns the warnings about a version text that is refused.
+strings refused(const std::string& version);
+strings operator+(strings left, const strings& right);
+
+/// What an action throws: an `int`, or one of the two standard errors.
+constexpr int nothing = 0;
+constexpr int badpath = -2;
+constexpr int out_of_range = -3;
+
+/// Runs `action` in this process and checks its warnings, in order, and what it throws.
+void check_action(
+    const std::function<void()>& action, const strings& warnings = {}, int thrown = nothing);
+
+/// Starts the built program and checks that it ends with `status`, prints nothing and writes the
+/// warnings. `prepare` runs in the child before it.
+void check_start(
+    const strings& warnings = {}, int status = 0, const std::function<void()>& prepare = {});
+
+/// A system call that the program is about to make, with those of its arguments that name a file
+/// of the device.
+struct system_call {
+    unsigned long number;
+    unsigned long arguments[6];
+    strings paths;
+};
+
+/// Says what becomes of a call: 0 lets it pass, an errno makes it fail without being done (x86-64
+/// only), and `kill_before` ends the program by SIGKILL.
+using judge = std::function<int(const system_call&)>;
+constexpr int kill_before = -1;
+
+/// Starts the program with `decide` asked about each of its system calls, and returns how it ended,
+/// as `waitpid` says it.
+int trace_start(const judge& decide);
