@@ -75,6 +75,7 @@ TEST_F(selection, keeps_resets_or_switches)
         {"2016e.1.0", "2016g.1.0", {incompatible}, "2016g.1.0", true, "2016f.1.0_2016g.1.0"},
         {"2016d.1.0", "2016e.1.0", {incompatible}, "2016e.1.0", true, "2016f.1.0_2016e.1.0"},
         {"2016i.1.0", "2016h.1.0", {incompatible, not_taken}, "", true}, // is not there, but newer
+        {"2017a.48", "2017b.48", {incompatible, not_taken}, "", true},
         {"2147483648a", "", {no_data}, ""},
         // The latest link leads elsewhere.
         {"2016g.1.0", "/usr/x", {bad_path + "/usr/x", no_data}, ""},
@@ -92,6 +93,7 @@ TEST_F(selection, keeps_resets_or_switches)
             install_update(version, "44l");
         }
         install_update("2017a.48", "48l");
+        install_update("2017b.48", "48l");
         link_data(directory(current));
         if (!latest.empty()) {
             make_link(paths::latest_link, directory(latest));

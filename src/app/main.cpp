@@ -1,6 +1,6 @@
-#include "app/console.h"
 #include "app/dataset_selection.h"
 #include "app/localtime_link.h"
+#include "app/process.h"
 #include "app/timezone_directories.h"
 #include "paths.h"
 
@@ -10,7 +10,7 @@
 
 int main()
 try {
-    prepare_console();
+    prepare_process();
     prepare_timezone_directories();
     std::remove(paths::cleanup_marker);
     std::remove(paths::stale_icu);
