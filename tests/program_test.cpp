@@ -6,7 +6,6 @@
 #include <string>
 
 #include <fcntl.h>
-#include <sys/resource.h>
 #include <sys/stat.h>
 #include <sys/syscall.h>
 #include <unistd.h>
@@ -112,30 +111,89 @@ TEST_F(program, creates_no_directory)
     check_nothing_at("/var/db");
 }
 
-TEST_F(program, makes_its_calls_in_order_and_each_warning_in_one_write)
+TEST_F(program, prepares_the_directories_that_are_there_before_anything_else)
 {
-    strings calls;
-    strings opened;
+    const auto first_calls = [](std::size_t count) {
+        strings calls;
+        trace_start([&](const system_call& call) {
+            if (call.number == SYS_openat && !call.paths.empty()) {
+                calls.push_back(call.paths[0] + " " + std::to_string(call.arguments[2]));
+            } else if (!call.paths.empty()) {
+                calls.push_back(call.paths[0]);
+            } else if (call.number == SYS_fcntl && call.arguments[1] == 64) {
+                calls.push_back("class " + std::to_string(call.arguments[2]));
+            } else if (call.number == SYS_close && !calls.empty()) {
+                calls.emplace_back("close");
+            }
+            return 0;
+        });
+        calls.resize(count);
+        return calls;
+    };
+    const std::string read_only = " " + std::to_string(O_RDONLY | O_CLOEXEC);
+    const strings first = {paths::timezone_directory + read_only, "class 4", "close"};
+    const strings opened = {paths::dataset_root + read_only};
+    const strings last = {paths::cleanup_marker, paths::stale_icu};
+    EXPECT_EQ(first_calls(8), first + opened + strings{"class 4", "close"} + last);
+    remove_all(paths::dataset_root);
+    EXPECT_EQ(first_calls(6), first + opened + last);
+}
+
+TEST_F(program, writes_each_warning_at_once)
+{
     int writes = 0;
     trace_start([&](const system_call& call) {
         writes += call.number == SYS_write && call.arguments[0] == STDERR_FILENO ? 1 : 0;
-        if (call.number == SYS_fcntl && call.arguments[1] == 64) {
-            calls.push_back("class " + std::to_string(call.arguments[2]));
-        }
-        for (const std::string& path : call.paths) {
-            if (!path.starts_with("/usr/share/")) {
-                calls.push_back(path);
-            }
-            if (call.number == SYS_openat && (call.arguments[2] & O_ACCMODE) != O_RDONLY) {
-                opened.push_back(path);
-            }
-        }
         return 0;
     });
     EXPECT_EQ(writes, 2);
-    EXPECT_EQ(opened, (strings{paths::cleanup_marker, paths::version_record}));
-    calls.resize(6);
-    EXPECT_EQ(calls, (strings{paths::timezone_directory, "class 4", paths::dataset_root, "class 4",
-                         paths::cleanup_marker, paths::stale_icu}));
+}
+
+TEST_F(program, opens_nothing_for_writing_but_the_marker_and_the_record)
+{
+    strings opened;
+    trace_start([&](const system_call& call) {
+        if (call.number == SYS_openat && !call.paths.empty() &&
+            (call.arguments[2] & O_ACCMODE) != O_RDONLY) {
+            opened.push_back(call.paths[0] + " " + std::to_string(call.arguments[2]));
+        }
+        return 0;
+    });
+    const int record_flags = O_WRONLY | O_CREAT | O_TRUNC;
+    EXPECT_EQ(opened,
+        (strings{std::string(paths::cleanup_marker) + " " + std::to_string(O_RDWR | O_CREAT),
+            std::string(paths::version_record) + " " + std::to_string(record_flags)}));
     check_done();
+}
+
+TEST_F(program, reports_a_marker_that_cannot_be_examined_or_closed)
+{
+    for (const unsigned long number : {SYS_newfstatat, SYS_close}) {
+        bool marker_is_open = false;
+        trace_start(
+            [&](const system_call& call) {
+                const bool fail = marker_is_open && call.number == number;
+                marker_is_open =
+                    !fail && (marker_is_open || (call.number == SYS_openat && !call.paths.empty() &&
+                                                    call.paths[0] == paths::cleanup_marker));
+                return fail ? EIO : 0;
+            },
+            {warnings[0], failed("Cannot touch file /var/db/timezone/needs_cleanup", EIO),
+                warnings[1]});
+        TearDown();
+        SetUp();
+    }
+}
+
+TEST_F(program, ends_with_0_when_no_file_can_be_opened)
+{
+    const int status = trace_start(
+        [](const system_call& call) {
+            return call.number == SYS_openat && !call.paths.empty() ? EMFILE : 0;
+        },
+        refused(".1.0") +
+            strings{
+                failed("Cannot touch file /var/db/timezone/needs_cleanup", EMFILE), warnings[1]});
+    EXPECT_EQ(status, 0);
+    check_data_links("/var/db/timezone/tz/2016g.1.0"); // the formats are unknown, and so the same
 }

@@ -158,15 +158,15 @@ void check_start(const strings& warnings, int status, const std::function<void()
     check_lines(close_scratch(errors), "mira_tzlinks", warnings);
 }
 
-int trace_start(const judge& decide)
+int trace_start(const judge& decide, const strings& warnings)
 {
-    const int output = open_scratch();
+    const int errors = open_scratch();
     const pid_t child = ::fork();
     if (child == 0) {
         ::setenv("ASAN_OPTIONS", "detect_leaks=0", 1); // the leak check would be a second tracer
         ::ptrace(PTRACE_TRACEME, 0, 0, 0);
         ::raise(SIGSTOP);
-        execute(output, output);
+        execute(errors, errors);
     }
     int status = 0;
     ::waitpid(child, &status, 0);
@@ -199,6 +199,9 @@ int trace_start(const judge& decide)
         ::waitpid(child, &status, 0);
     }
     ::close(memory);
-    ::close(output);
+    const std::string output = close_scratch(errors);
+    if (!warnings.empty()) {
+        check_lines(output, "mira_tzlinks", warnings);
+    }
     return status;
 }

@@ -40,6 +40,6 @@ struct system_call {
 using judge = std::function<int(const system_call&)>;
 constexpr int kill_before = -1;
 
-/// Starts the program with `decide` asked about each of its system calls, and returns how it ended,
-/// as `waitpid` says it.
-int trace_start(const judge& decide);
+/// Starts the program with `decide` asked about each of its system calls, checks its warnings where
+/// any are given, and returns how it ended, as `waitpid` says it.
+int trace_start(const judge& decide, const strings& warnings = {});
