@@ -20,7 +20,7 @@ const std::string icu_directory = dataset + "/icutz/";
 void check_format(const std::string& format)
 {
     for (const std::string& system : {format, format + "x"}) {
-        make_file("/usr/share/icu/icutzformat.txt", system);
+        make_file("/usr/share/icu/icutzformat.txt", system.empty() ? "\n" : " " + system + " more");
         check_action([&] {
             EXPECT_EQ(mira_icu(dataset).compatible_schema(mira_icu()), system == format) << system;
         });
@@ -33,51 +33,16 @@ TEST_F(zoneinfo, version_is_the_first_word_of_its_file)
 {
     const std::string long_word(70'000, 'x');
     const std::pair<std::string, std::string> contents[] = {{"2016f\n", "2016f"},
-        {" \t\v\f\r\n2016f extra\n", "2016f"}, {"*\x01\xff", "*\x01\xff"},
-        {long_word + "\vy", long_word}, {"", ""}, {" \n\t", ""}};
+        {" \t\v\f\r\n2016f extra\n", "2016f"}, {long_word + "\v\xff", long_word}, {"", ""},
+        {" \n\t", ""}};
     for (const auto& [content, word] : contents) {
         make_file("/usr/share/zoneinfo.default/+VERSION", content);
-        make_file(dataset + "/zoneinfo/+VERSION", content + " ");
-        check_action([word = word] {
-            EXPECT_EQ(mira_zoneinfo().version_string(), word);
-            EXPECT_EQ(mira_zoneinfo(dataset).version_string(), word);
-        });
+        check_action([word = word] { EXPECT_EQ(mira_zoneinfo().version_string(), word); });
     }
-    make_directory("/var/x/zoneinfo/+VERSION");
-    check_action([] { EXPECT_EQ(mira_zoneinfo("/var/x").version_string(), ""); });
-    check_action([] { EXPECT_EQ(mira_zoneinfo("/var/missing").version_string(), ""); });
-}
-
-TEST_F(zoneinfo, tries_the_new_link_when_the_old_one_cannot_be_removed)
-{
-    make_directory(paths::zoneinfo_link);
-    check_action([] { mira_zoneinfo(dataset).make_current(); },
-        {failed("remove: could not remove /var/db/timezone/zoneinfo", EISDIR),
-            failed("Unlink of zoneinfo softlink failed", EISDIR),
-            failed("create_symlink: from /var/db/timezone/zoneinfo to " + dataset + "/zoneinfo",
-                EEXIST)},
-        EEXIST);
-}
-
-TEST_F(icu, tries_the_new_link_when_the_old_one_cannot_be_removed)
-{
-    make_directory(paths::icu_link);
-    const strings not_removed = {failed("remove: could not remove /var/db/icutz", EISDIR),
-        failed("unlink of ICU softlink failed", EISDIR)};
-    check_action([] { mira_icu().make_current(); }, not_removed);
-    check_action([] { mira_icu(dataset).make_current(); },
-        not_removed +
-            strings{failed("create_symlink: from /var/db/icutz to " + dataset + "/icutz", EEXIST)},
-        EEXIST);
-}
-
-TEST_F(icu, format_of_the_system_is_the_first_word_of_its_file)
-{
-    make_file(icu_directory + "icutz44l.dat");
-    for (const std::string content : {"44l", " \n44l and more\n"}) {
-        make_file("/usr/share/icu/icutzformat.txt", content);
-        check_action([] { EXPECT_TRUE(mira_icu(dataset).compatible_schema(mira_icu())); });
-    }
+    make_directory(dataset + "/zoneinfo/+VERSION");
+    check_action([] { EXPECT_EQ(mira_zoneinfo(dataset).version_string(), ""); });
+    make_file(dataset + "/zoneinfo/+VERSION", "2016f");
+    check_action([] { EXPECT_EQ(mira_zoneinfo(dataset).version_string(), "2016f"); });
 }
 
 TEST_F(icu, format_is_in_the_name_of_a_regular_file_that_everyone_may_read)
@@ -112,10 +77,9 @@ TEST_F(icu, format_is_that_of_the_first_file_that_the_directory_lists)
 TEST_F(icu, directory_may_be_a_link)
 {
     make_file("/var/elsewhere/icutz44l.dat");
-    make_link(dataset, "/var");
-    make_link("/var/icutz", "elsewhere");
+    make_link(dataset + "/icutz", "/var/elsewhere");
     check_format("44l");
-    make_link("/var/icutz", "icutz");
+    make_link(dataset + "/icutz", "icutz");
     check_format("");
 }
 

@@ -8,6 +8,7 @@
 #include <filesystem>
 #include <fstream>
 #include <iterator>
+#include <set>
 
 #include <sched.h>
 #include <sys/mount.h>
@@ -18,8 +19,6 @@ namespace fs = std::filesystem;
 
 namespace
 {
-
-constexpr const char* device_roots[] = {"/usr/share", "/var"};
 
 /// Enters a private mount namespace, as root of a user namespace where the caller is not root.
 /// Returns 0 or the errno of the refusal.
@@ -40,43 +39,42 @@ int enter_namespace()
 
 } // namespace
 
-void device::SetUp()
+void device::renew()
 {
     static const int refusal = enter_namespace();
     if (refusal != 0 && std::getenv("CI") == nullptr) {
         GTEST_SKIP() << "the kernel refuses a mount namespace: " << std::strerror(refusal);
     }
     ASSERT_EQ(refusal, 0) << std::strerror(refusal);
-    for (const char* root : device_roots) {
+    for (const char* root : {"/usr/share", "/var"}) {
+        static std::set<std::string> mounted;
+        if (!mounted.insert(root).second) {
+            ::umount2(root, MNT_DETACH);
+        }
         ASSERT_EQ(::mount("tmpfs", root, "tmpfs", 0, "mode=0755"), 0) << std::strerror(errno);
     }
     ::umask(022);
     make_directory(paths::dataset_root);
 }
 
-void device::TearDown()
-{
-    for (const char* root : device_roots) {
-        ::umount2(root, MNT_DETACH);
-    }
-}
-
 void make_file(const std::string& path, const std::string& content, mode_t mode)
 {
     remove_all(path);
-    make_directory(fs::path(path).parent_path());
+    fs::create_directories(fs::path(path).parent_path());
     std::ofstream(path, std::ios::binary) << content;
     fs::permissions(path, fs::perms(mode));
 }
 
 void make_directory(const std::string& path)
 {
+    remove_all(path);
     fs::create_directories(path);
 }
 
 void make_link(const std::string& path, const std::string& text)
 {
     remove_all(path);
+    fs::create_directories(fs::path(path).parent_path());
     fs::create_symlink(text, path);
 }
 
@@ -113,31 +111,23 @@ void link_data(const std::string& dataset)
     }
 }
 
-void check_link(const std::string& path, const std::string& text)
+std::string entry(const std::string& path)
 {
-    ASSERT_TRUE(fs::is_symlink(path)) << path;
-    EXPECT_EQ(fs::read_symlink(path).string(), text);
-}
-
-void check_file(const std::string& path, const std::string& content)
-{
-    ASSERT_TRUE(fs::is_regular_file(fs::symlink_status(path))) << path;
-    std::ifstream file(path, std::ios::binary);
-    EXPECT_EQ(std::string(std::istreambuf_iterator<char>(file), {}), content);
-}
-
-void check_nothing_at(const std::string& path)
-{
-    EXPECT_FALSE(fs::exists(fs::symlink_status(path))) << path;
+    const fs::file_status status = fs::symlink_status(path);
+    if (fs::is_symlink(status)) {
+        return "-> " + fs::read_symlink(path).string();
+    }
+    if (fs::is_regular_file(status)) {
+        std::ifstream file(path, std::ios::binary);
+        return "[" + std::string(std::istreambuf_iterator<char>(file), {}) + "]";
+    }
+    return fs::exists(status) ? "directory" : "nothing";
 }
 
 void check_data_links(const std::string& dataset)
 {
-    if (dataset.empty()) {
-        check_link(paths::zoneinfo_link, "/usr/share/zoneinfo.default");
-        check_nothing_at(paths::icu_link);
-    } else {
-        check_link(paths::zoneinfo_link, dataset + "/zoneinfo");
-        check_link(paths::icu_link, dataset + "/icutz");
-    }
+    const bool system = dataset.empty();
+    EXPECT_EQ(entry(paths::zoneinfo_link),
+        system ? "-> /usr/share/zoneinfo.default" : "-> " + dataset + "/zoneinfo");
+    EXPECT_EQ(entry(paths::icu_link), system ? "nothing" : "-> " + dataset + "/icutz");
 }

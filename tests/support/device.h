@@ -14,11 +14,13 @@ using strings = std::vector<std::string>;
 class device : public testing::Test
 {
 protected:
-    void SetUp() override;
-    void TearDown() override;
+    void SetUp() override { renew(); }
+
+    /// Puts an empty device in place of the one so far.
+    void renew();
 };
 
-/// Creates a file and the directories above it, in place of the file, link or directory there.
+/// Each makes an entry in place of the one that is there, and the directories above it.
 void make_file(const std::string& path, const std::string& content = {}, mode_t mode = 0644);
 void make_directory(const std::string& path);
 void make_link(const std::string& path, const std::string& text);
@@ -31,8 +33,8 @@ std::string install_update(const std::string& version, const std::string& format
 /// Links the data of the dataset in the directory `dataset`, or of the system where it is empty.
 void link_data(const std::string& dataset);
 
-void check_link(const std::string& path, const std::string& text);
-void check_file(const std::string& path, const std::string& content);
-void check_nothing_at(const std::string& path);
+/// Returns what is at `path`: "-> " and a link's text, a file's content in brackets, "directory",
+/// or "nothing".
+std::string entry(const std::string& path);
 /// Checks that the data links are as `link_data` makes them.
 void check_data_links(const std::string& dataset);
