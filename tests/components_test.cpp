@@ -4,6 +4,7 @@
 #include "support/run.h"
 
 #include <cerrno>
+#include <cstring>
 #include <filesystem>
 #include <string>
 
@@ -81,6 +82,16 @@ TEST_F(icu, directory_may_be_a_link)
     check_format("44l");
     make_link(dataset + "/icutz", "icutz");
     check_format("");
+}
+
+TEST_F(icu, directory_that_cannot_be_walked_throws_enametoolong)
+{
+    const std::string path(70'000, 'x'); // longer than the walk can hold
+    const std::string text = std::strerror(ENAMETOOLONG);
+    check_action([&] { mira_icu{path}; },
+        {failed(
+            "tz_icu::initialize: fts_open of " + path + "/icutz failed, " + text, ENAMETOOLONG)},
+        ENAMETOOLONG);
 }
 
 TEST_F(icu, is_compatible_with_icu_data_only)
