@@ -157,7 +157,7 @@ TEST_F(program, writes_each_warning_at_once_and_opens_only_its_own_files_for_wri
 
 TEST_F(program, reports_a_marker_that_cannot_be_examined_or_closed)
 {
-    for (const unsigned long number : {SYS_newfstatat, SYS_close}) {
+    for (const int number : {SYS_newfstatat, SYS_close}) {
         SetUp();
         bool marker_is_open = false;
         trace_start(

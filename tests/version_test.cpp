@@ -37,7 +37,7 @@ TEST(version, is_parsed_from_a_text)
         {million_zeros + "7a." + million_zeros, version(7, "a", 0)},
     };
     for (const auto& [text, fields] : accepted) {
-        check_action([&] { EXPECT_EQ(mira_version(text), fields) << text.substr(0, 40); });
+        check_action([text = text, fields = fields] { EXPECT_EQ(mira_version(text), fields); });
     }
 }
 

@@ -89,7 +89,7 @@ void set_register(pid_t process, std::size_t offset, long value)
 
 system_call entered_call(const __ptrace_syscall_info& info, int memory)
 {
-    system_call call{info.entry.nr, {}, {}};
+    system_call call{static_cast<long>(info.entry.nr), {}, {}};
     for (int i = 0; i < 6; ++i) {
         call.arguments[i] = info.entry.args[i];
         char text[1001] = {};

@@ -30,7 +30,7 @@ void check_start(
 /// A system call that the program is about to make, with those of its arguments that name a file
 /// of the device.
 struct system_call {
-    unsigned long number;
+    long number;
     unsigned long arguments[6];
     strings paths;
 };
