@@ -2,8 +2,7 @@
 
 /// The system's paths, all of them, with the names that the system uses for them. They are compiled
 /// in: there is no option, variable or file that changes one.
-namespace paths
-{
+namespace paths {
 
 // The read-only system partition.
 inline constexpr char system_zoneinfo[] = "/usr/share/zoneinfo.default";

@@ -8,8 +8,7 @@
 #include <filesystem>
 #include <string>
 
-namespace
-{
+namespace {
 
 using zoneinfo = device;
 using icu = device;
@@ -18,8 +17,7 @@ const std::string dataset = "/var/db/timezone/tz/2016f.1.0";
 const std::string icu_directory = dataset + "/icutz/";
 
 /// Checks the format of the data in `dataset` beside a system of that format and of another.
-void check_format(const std::string& format)
-{
+void check_format(const std::string& format) {
     for (const std::string& system : {format, format + "x"}) {
         make_file("/usr/share/icu/icutzformat.txt", system.empty() ? "\n" : " " + system + " more");
         check_action([&] {
@@ -30,8 +28,7 @@ void check_format(const std::string& format)
 
 } // namespace
 
-TEST_F(zoneinfo, version_is_the_first_word_of_its_file)
-{
+TEST_F(zoneinfo, version_is_the_first_word_of_its_file) {
     const std::string long_word(70'000, 'x');
     const std::pair<std::string, std::string> contents[] = {{"2016f\n", "2016f"},
         {" \t\v\f\r\n2016f extra\n", "2016f"}, {long_word + "\v\xff", long_word}, {"", ""},
@@ -46,8 +43,7 @@ TEST_F(zoneinfo, version_is_the_first_word_of_its_file)
     check_action([] { EXPECT_EQ(mira_zoneinfo(dataset).version_string(), "2016f"); });
 }
 
-TEST_F(icu, format_is_in_the_name_of_a_regular_file_that_everyone_may_read)
-{
+TEST_F(icu, format_is_in_the_name_of_a_regular_file_that_everyone_may_read) {
     check_format("");
     for (const std::string name : {"icutz44L.dat", "icutz44x.dat", "icutzl.dat", "icutz44.dat",
              "icutz44l.dat.bak", "xicutz44l.dat", "icutz44l.DAT", "icutz44lxdat", "icutz/l.dat",
@@ -66,8 +62,7 @@ TEST_F(icu, format_is_in_the_name_of_a_regular_file_that_everyone_may_read)
     }
 }
 
-TEST_F(icu, format_is_that_of_the_first_file_that_the_directory_lists)
-{
+TEST_F(icu, format_is_that_of_the_first_file_that_the_directory_lists) {
     for (const std::string format : {"44l", "45b", "46e"}) {
         make_file(icu_directory + "icutz" + format + ".dat");
     }
@@ -75,8 +70,7 @@ TEST_F(icu, format_is_that_of_the_first_file_that_the_directory_lists)
     check_format(first->path().filename().string().substr(5, 3));
 }
 
-TEST_F(icu, directory_may_be_a_link)
-{
+TEST_F(icu, directory_may_be_a_link) {
     make_file("/var/elsewhere/icutz44l.dat");
     make_link(dataset + "/icutz", "/var/elsewhere");
     check_format("44l");
@@ -84,8 +78,7 @@ TEST_F(icu, directory_may_be_a_link)
     check_format("");
 }
 
-TEST_F(icu, directory_that_cannot_be_walked_throws_enametoolong)
-{
+TEST_F(icu, directory_that_cannot_be_walked_throws_enametoolong) {
     const std::string path(70'000, 'x'); // longer than the walk can hold
     const std::string text = std::strerror(ENAMETOOLONG);
     check_action([&] { mira_icu{path}; },
@@ -94,8 +87,7 @@ TEST_F(icu, directory_that_cannot_be_walked_throws_enametoolong)
         ENAMETOOLONG);
 }
 
-TEST_F(icu, is_compatible_with_icu_data_only)
-{
+TEST_F(icu, is_compatible_with_icu_data_only) {
     check_action([] { EXPECT_FALSE(mira_icu().compatible_schema(mira_zoneinfo())); },
         {"mira_icu::compatible_schema: could not dynamic_cast other component"});
     check_action([] { EXPECT_TRUE(mira_zoneinfo().compatible_schema(mira_icu())); });

@@ -11,8 +11,7 @@
 
 namespace fs = std::filesystem;
 
-namespace
-{
+namespace {
 
 /// A device with the system dataset 2016f, whose current dataset is an update or, where it is
 /// empty, the system's, and whose latest dataset is 2016g or none.
@@ -26,8 +25,7 @@ const state states[] = {
 /// Starts the program and calls `verdict` on the call of the given number, counted from the first
 /// that names a file of the device; only those are made to fail. Returns the name of the file last
 /// named by then, or an empty text when the program made fewer calls.
-std::string disturb(int number, int verdict)
-{
+std::string disturb(int number, int verdict) {
     std::string name;
     std::string disturbed;
     const int status = trace_start([&](const system_call& call) {
@@ -45,8 +43,7 @@ std::string disturb(int number, int verdict)
 using entries = std::map<std::string, std::string>;
 
 /// Starts the program undisturbed, checks where the links lead, and returns what is at each path.
-entries start()
-{
+entries start() {
     EXPECT_EQ(trace_start([](const system_call&) { return 0; }), 0);
     entries left;
     for (const std::string path : {paths::zoneinfo_link, paths::icu_link, paths::localtime_link,
@@ -59,11 +56,9 @@ entries start()
     return left;
 }
 
-class faults : public device
-{
+class faults : public device {
 protected:
-    void make_device(const state& before)
-    {
+    void make_device(const state& before) {
         renew();
         install_system("2016f");
         link_data(before.current.empty() ? "" : install_update(before.current));
@@ -76,8 +71,7 @@ protected:
 
 } // namespace
 
-TEST_F(faults, never_keep_the_next_start_from_linking_usable_data)
-{
+TEST_F(faults, never_keep_the_next_start_from_linking_usable_data) {
     for (const state& before : states) {
         std::string disturbed = "none yet";
         for (int number = 0; !disturbed.empty(); ++number) {
@@ -89,8 +83,7 @@ TEST_F(faults, never_keep_the_next_start_from_linking_usable_data)
     }
 }
 
-TEST_F(faults, lose_what_the_manual_names_and_no_more_when_the_power_is_cut)
-{
+TEST_F(faults, lose_what_the_manual_names_and_no_more_when_the_power_is_cut) {
     std::set<std::string> lost;
     for (const state& before : states) {
         make_device(before);

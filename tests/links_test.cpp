@@ -10,8 +10,7 @@
 
 #include <unistd.h>
 
-namespace
-{
+namespace {
 
 using links = device;
 
@@ -19,8 +18,7 @@ const std::string root = "/var/db/timezone/tz/";
 
 } // namespace
 
-TEST_F(links, are_read_up_to_1024_bytes)
-{
+TEST_F(links, are_read_up_to_1024_bytes) {
     for (const std::size_t length : {1U, 1023U, 1024U, 1025U, 1030U}) {
         make_link("/var/link", std::string(length, 'x'));
         const std::string text(std::min<std::size_t>(length, 1024), 'x');
@@ -28,8 +26,7 @@ TEST_F(links, are_read_up_to_1024_bytes)
     }
 }
 
-TEST_F(links, fail_with_the_errno_of_the_call_even_when_the_warning_cannot_be_written)
-{
+TEST_F(links, fail_with_the_errno_of_the_call_even_when_the_warning_cannot_be_written) {
     const std::pair<int, void (*)()> failures[] = {{EISDIR, [] { fsutil::remove("/var/db"); }},
         {EINVAL, [] { fsutil::read_symlink("/var/db"); }},
         {EEXIST, [] { fsutil::create_symlink("new", "/var/db"); }}};
@@ -43,8 +40,7 @@ TEST_F(links, fail_with_the_errno_of_the_call_even_when_the_warning_cannot_be_wr
     }
 }
 
-TEST_F(links, to_zoneinfo_name_the_directory_above_the_tree)
-{
+TEST_F(links, to_zoneinfo_name_the_directory_above_the_tree) {
     const std::pair<std::string, std::string> accepted[] = {{"/usr/share/zoneinfo.default", ""},
         {root + "2016f.1.0/zoneinfo", root + "2016f.1.0"}, {root + "a/b/x", root + "a/b"},
         {root + "x/", root + "x"}, {root + "//x", root + "/"}};
@@ -62,8 +58,7 @@ TEST_F(links, to_zoneinfo_name_the_directory_above_the_tree)
     }
 }
 
-TEST_F(links, to_datasets_lead_below_the_dataset_root)
-{
+TEST_F(links, to_datasets_lead_below_the_dataset_root) {
     for (const std::string name : {"x", "/", "2016f.1.0/", "2016f.1.0/zoneinfo", "../2016f"}) {
         check_action(
             [&] { EXPECT_EQ(mira_dataset(root + name).version_string(), name); }, refused(name));

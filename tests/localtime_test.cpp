@@ -7,8 +7,7 @@
 
 #include <sys/mount.h>
 
-namespace
-{
+namespace {
 
 using localtime_link = device;
 
@@ -20,8 +19,7 @@ const std::string create = "create_symlink: from /var/db/timezone/localtime to "
 
 } // namespace
 
-TEST_F(localtime_link, is_kept_corrected_or_reset)
-{
+TEST_F(localtime_link, is_kept_corrected_or_reset) {
     install_system();
     link_data("");
     const std::string zones = "/var/db/timezone/zoneinfo";
@@ -55,8 +53,7 @@ TEST_F(localtime_link, is_kept_corrected_or_reset)
     EXPECT_EQ(entry(place), "-> " + default_link);
 }
 
-TEST_F(localtime_link, takes_the_place_of_what_can_be_deleted)
-{
+TEST_F(localtime_link, takes_the_place_of_what_can_be_deleted) {
     const strings warnings = {failed("read_symlink: " + place, EINVAL), failed(reset, EINVAL)};
     make_file(place);
     check_action(repair_localtime_link, warnings);
@@ -66,8 +63,7 @@ TEST_F(localtime_link, takes_the_place_of_what_can_be_deleted)
     EXPECT_EQ(entry(place), "-> " + default_link);
 }
 
-TEST_F(localtime_link, throws_when_even_the_default_link_cannot_be_created)
-{
+TEST_F(localtime_link, throws_when_even_the_default_link_cannot_be_created) {
     install_system();
     link_data("");
     make_link(place, "/usr/share/zoneinfo/Asia/Tokyo");

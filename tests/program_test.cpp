@@ -10,8 +10,7 @@
 #include <sys/syscall.h>
 #include <unistd.h>
 
-namespace
-{
+namespace {
 
 const std::string given_up = "Symlink points at data incompatible with installed system";
 const std::string reset = "localtime link invalid; resetting to America/Los_Angeles";
@@ -19,11 +18,9 @@ const std::string not_touched = "Cannot touch file /var/db/timezone/needs_cleanu
 
 /// A device whose next start gives up an update and switches to another, so that every link and
 /// file is written.
-class program : public device
-{
+class program : public device {
 protected:
-    void SetUp() override
-    {
+    void SetUp() override {
         renew();
         install_system("2016f");
         link_data(install_update("2016e.1.0"));
@@ -31,8 +28,7 @@ protected:
         make_file(paths::version_record, std::string(100, 'x'));
     }
 
-    static void check_done()
-    {
+    static void check_done() {
         check_data_links("/var/db/timezone/tz/2016g.1.0");
         EXPECT_EQ(entry(paths::cleanup_marker), "[]");
         EXPECT_EQ(entry(paths::version_record), "[2016f.1.0_2016g.1.0]");
@@ -40,28 +36,24 @@ protected:
     }
 };
 
-bool opens(const system_call& call)
-{
+bool opens(const system_call& call) {
     return call.number == SYS_openat && !call.paths.empty();
 }
 
 } // namespace
 
-TEST_F(program, creates_its_files_with_the_modes_that_the_mask_leaves)
-{
+TEST_F(program, creates_its_files_with_the_modes_that_the_mask_leaves) {
     remove_all(paths::version_record);
     check_start({given_up, reset}, 0, [] { ::umask(0); });
     check_done();
     for (const char* file : {paths::cleanup_marker, paths::version_record}) {
-        struct stat status {
-        };
+        struct stat status {};
         EXPECT_EQ(::stat(file, &status), 0);
         EXPECT_EQ(status.st_mode, S_IFREG | 0666U);
     }
 }
 
-TEST_F(program, does_its_work_whatever_becomes_of_its_standard_streams)
-{
+TEST_F(program, does_its_work_whatever_becomes_of_its_standard_streams) {
     const std::function<void()> preparations[] = {
         [] { ::close_range(0, 2, 0); },
         [] { ::close(STDERR_FILENO); },
@@ -81,8 +73,7 @@ TEST_F(program, does_its_work_whatever_becomes_of_its_standard_streams)
     }
 }
 
-TEST_F(program, deletes_what_earlier_starts_left)
-{
+TEST_F(program, deletes_what_earlier_starts_left) {
     link_data("");
     remove_all(paths::latest_link);
     make_link(paths::localtime_link, "/var/db/timezone/zoneinfo");
@@ -99,8 +90,7 @@ TEST_F(program, deletes_what_earlier_starts_left)
     EXPECT_EQ(entry(paths::stale_icu), "directory");
 }
 
-TEST_F(program, creates_no_directory)
-{
+TEST_F(program, creates_no_directory) {
     remove_all("/var/db");
     const std::string not_created = failed(
         "create_symlink: from /var/db/timezone/zoneinfo to /usr/share/zoneinfo.default", ENOENT);
@@ -112,8 +102,7 @@ TEST_F(program, creates_no_directory)
     EXPECT_EQ(entry("/var/db"), "nothing");
 }
 
-TEST_F(program, prepares_the_directories_that_are_there_before_anything_else)
-{
+TEST_F(program, prepares_the_directories_that_are_there_before_anything_else) {
     const auto first_calls = [](std::size_t count) {
         strings calls;
         trace_start([&](const system_call& call) {
@@ -139,8 +128,7 @@ TEST_F(program, prepares_the_directories_that_are_there_before_anything_else)
     EXPECT_EQ(first_calls(6), first + opened + last);
 }
 
-TEST_F(program, writes_each_warning_at_once_and_opens_only_its_own_files_for_writing)
-{
+TEST_F(program, writes_each_warning_at_once_and_opens_only_its_own_files_for_writing) {
     int writes = 0;
     strings opened;
     trace_start([&](const system_call& call) {
@@ -155,8 +143,7 @@ TEST_F(program, writes_each_warning_at_once_and_opens_only_its_own_files_for_wri
                           paths::version_record + std::to_string(O_WRONLY | O_CREAT | O_TRUNC)}));
 }
 
-TEST_F(program, reports_a_marker_that_cannot_be_examined_or_closed)
-{
+TEST_F(program, reports_a_marker_that_cannot_be_examined_or_closed) {
     for (const int number : {SYS_newfstatat, SYS_close}) {
         SetUp();
         bool marker_is_open = false;
@@ -171,8 +158,7 @@ TEST_F(program, reports_a_marker_that_cannot_be_examined_or_closed)
     }
 }
 
-TEST_F(program, goes_on_when_no_file_can_be_opened)
-{
+TEST_F(program, goes_on_when_no_file_can_be_opened) {
     const int status = trace_start([](const system_call& call) { return opens(call) ? EMFILE : 0; },
         refused(".1.0") + strings{failed(not_touched, EMFILE), reset});
     EXPECT_EQ(status, 0);

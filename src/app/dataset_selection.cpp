@@ -12,11 +12,9 @@
 #include <sys/stat.h>
 #include <unistd.h>
 
-namespace
-{
+namespace {
 
-std::string read_current_link_or_reset()
-{
+std::string read_current_link_or_reset() {
     try {
         return read_current_link();
     } catch (...) {
@@ -28,8 +26,7 @@ std::string read_current_link_or_reset()
 
 } // namespace
 
-void select_dataset()
-{
+void select_dataset() {
     const mira_dataset system;
     const std::string latest_path = read_latest_link();
     const mira_dataset current(read_current_link_or_reset());
@@ -59,14 +56,12 @@ void select_dataset()
     write_version_diff_record(*active, latest);
 }
 
-void reset_to_system_partition()
-{
+void reset_to_system_partition() {
     const mira_dataset system;
     system.make_current();
 }
 
-void touch_cleanup_marker()
-{
+void touch_cleanup_marker() {
     const int marker = open_dprotected_np(paths::cleanup_marker, O_RDWR | O_CREAT, 4, 0, 0666);
     bool touched = false;
     if (marker != -1) {
@@ -79,8 +74,7 @@ void touch_cleanup_marker()
     }
 }
 
-void write_version_diff_record(const mira_dataset& active, const mira_dataset& latest)
-{
+void write_version_diff_record(const mira_dataset& active, const mira_dataset& latest) {
     try {
         std::ofstream record(paths::version_record);
         record << active.version_string() << '_' << latest.version_string();

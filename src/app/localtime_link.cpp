@@ -9,22 +9,19 @@
 
 #include <err.h>
 
-namespace
-{
+namespace {
 
 constexpr char default_zone[] = "America/Los_Angeles";
 constexpr char default_zone_path[] = "/var/db/timezone/zoneinfo/America/Los_Angeles";
 
-void replace_localtime_link(const std::string& target)
-{
+void replace_localtime_link(const std::string& target) {
     // Of no interest: what could not be deleted fails the creation, which reports it.
     std::remove(paths::localtime_link);
     fsutil::create_symlink(target, paths::localtime_link);
 }
 
 /// Throws whenever the link can be neither kept nor corrected.
-void keep_or_correct_localtime_link()
-{
+void keep_or_correct_localtime_link() {
     constexpr int invalid_link = -1;
     constexpr std::string_view correctable = paths::read_only_zoneinfo;
 
@@ -46,8 +43,7 @@ void keep_or_correct_localtime_link()
 
 } // namespace
 
-void repair_localtime_link()
-{
+void repair_localtime_link() {
     try {
         keep_or_correct_localtime_link();
     } catch (...) {

@@ -8,8 +8,7 @@
 
 #include <err.h>
 
-int main()
-try {
+int main() try {
     prepare_process();
     prepare_timezone_directories();
     std::remove(paths::cleanup_marker);

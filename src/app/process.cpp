@@ -7,8 +7,7 @@
 
 #include <limits.h>
 
-void prepare_process()
-{
+void prepare_process() {
     std::set_terminate([] { std::_Exit(EXIT_FAILURE); });
     std::signal(SIGPIPE, SIG_IGN);
 

@@ -8,8 +8,7 @@
 ///
 /// The destructor is not virtual and not public: a component is made with `std::make_shared` of its
 /// own class, whose deleter knows that class, and deleting one through the base does not compile.
-class mira_dataset_component
-{
+class mira_dataset_component {
 public:
     /// Returns whether this component's data has a format that readers of `other`'s data can read.
     virtual bool compatible_schema(const mira_dataset_component& other) const = 0;
@@ -22,9 +21,7 @@ public:
 protected:
     mira_dataset_component() = default;
     explicit mira_dataset_component(std::string dataset_path)
-        : dataset_path_(std::move(dataset_path))
-    {
-    }
+        : dataset_path_(std::move(dataset_path)) {}
     ~mira_dataset_component() = default;
 
     /// The directory of the dataset; empty for the system dataset.

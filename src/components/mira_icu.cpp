@@ -13,8 +13,7 @@
 #include <fts.h>
 #include <sys/stat.h>
 
-namespace
-{
+namespace {
 
 struct walk_closer {
     void operator()(FTS* walk) const { ::fts_close(walk); }
@@ -23,8 +22,7 @@ using file_walk = std::unique_ptr<FTS, walk_closer>;
 
 /// Opens a walk that follows no link but `root` itself and stays on its file system. Entries come
 /// in the order in which the file system lists them.
-file_walk open_walk(std::string root)
-{
+file_walk open_walk(std::string root) {
     char* const roots[] = {root.data(), nullptr};
     file_walk walk(::fts_open(roots, FTS_COMFOLLOW | FTS_PHYSICAL | FTS_XDEV, nullptr));
     if (walk == nullptr) {
@@ -37,8 +35,7 @@ file_walk open_walk(std::string root)
 
 /// Returns whether the walk's entry is a regular file directly inside the root that everyone may
 /// read.
-bool may_be_data_file(const FTSENT& entry)
-{
+bool may_be_data_file(const FTSENT& entry) {
     return entry.fts_errno == 0 && entry.fts_level == 1 && entry.fts_namelen != 0 &&
            entry.fts_info == FTS_F && (entry.fts_statp->st_mode & S_IROTH) != 0;
 }
@@ -47,13 +44,11 @@ bool may_be_data_file(const FTSENT& entry)
 
 mira_icu::mira_icu(const std::string& dataset_path)
     : mira_dataset_component(dataset_path),
-      icu_path_(dataset_path.empty() ? paths::system_icu : dataset_path + "/icutz")
-{
+      icu_path_(dataset_path.empty() ? paths::system_icu : dataset_path + "/icutz") {
     initialize();
 }
 
-void mira_icu::initialize()
-{
+void mira_icu::initialize() {
     if (dataset_path().empty()) {
         read_system_format();
     } else {
@@ -61,15 +56,13 @@ void mira_icu::initialize()
     }
 }
 
-void mira_icu::read_system_format()
-{
+void mira_icu::read_system_format() {
     std::ifstream file(icu_path_ + "/icutzformat.txt");
     file >> format_;
 }
 
 /// Takes the format from the name of the first data file that the directory lists.
-void mira_icu::find_format()
-{
+void mira_icu::find_format() {
     const byte_regex data_file_name(R"(icutz([0-9]+[lbe])\.dat)");
     const file_walk walk = open_walk(icu_path_);
     const FTSENT* entry = nullptr;
@@ -82,8 +75,7 @@ void mira_icu::find_format()
     }
 }
 
-bool mira_icu::compatible_schema(const mira_dataset_component& other) const
-{
+bool mira_icu::compatible_schema(const mira_dataset_component& other) const {
     const auto* const other_icu = dynamic_cast<const mira_icu*>(&other);
     if (other_icu == nullptr) {
         warn("mira_icu::compatible_schema: could not dynamic_cast other component");
@@ -92,8 +84,7 @@ bool mira_icu::compatible_schema(const mira_dataset_component& other) const
     return format_ == other_icu->format_;
 }
 
-void mira_icu::make_current() const
-{
+void mira_icu::make_current() const {
     try {
         fsutil::remove(paths::icu_link);
     } catch (...) {

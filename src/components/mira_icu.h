@@ -6,8 +6,7 @@
 
 /// ICU time-zone data: "/usr/share/icu" in the system dataset, the subdirectory "icutz" of an
 /// updated dataset.
-class mira_icu final : public mira_dataset_component
-{
+class mira_icu final : public mira_dataset_component {
 public:
     /// Builds the component of the dataset in the directory `dataset_path`; the empty path is the
     /// system dataset. Data that is missing or cannot be read is no failure: the format is empty.

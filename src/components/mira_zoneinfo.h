@@ -6,8 +6,7 @@
 
 /// A compiled tz database tree: "/usr/share/zoneinfo.default" in the system dataset, the
 /// subdirectory "zoneinfo" of an updated dataset.
-class mira_zoneinfo final : public mira_dataset_component
-{
+class mira_zoneinfo final : public mira_dataset_component {
 public:
     /// Builds the component of the dataset in the directory `dataset_path`; the empty path is the
     /// system dataset. A missing tree is no failure.

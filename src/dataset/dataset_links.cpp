@@ -7,18 +7,15 @@
 
 #include <err.h>
 
-std::string read_latest_link()
-{
+std::string read_latest_link() {
     return fsutil::read_symlink(paths::latest_link);
 }
 
-std::string read_current_link()
-{
+std::string read_current_link() {
     return dataset_path_from_zoneinfo_link(fsutil::read_symlink(paths::zoneinfo_link));
 }
 
-std::string dataset_path_from_zoneinfo_link(const std::string& text)
-{
+std::string dataset_path_from_zoneinfo_link(const std::string& text) {
     constexpr std::string_view root = paths::dataset_root;
     constexpr int bad_link = -1;
 

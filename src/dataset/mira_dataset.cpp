@@ -11,13 +11,11 @@
 
 #include <err.h>
 
-mira_dataset::mira_dataset(const std::string& path) : path_(path)
-{
+mira_dataset::mira_dataset(const std::string& path) : path_(path) {
     create_components();
 }
 
-void mira_dataset::create_components()
-{
+void mira_dataset::create_components() {
     constexpr std::string_view root = paths::dataset_root;
 
     auto zoneinfo = std::make_shared<mira_zoneinfo>(path_);
@@ -34,15 +32,13 @@ void mira_dataset::create_components()
     components_.push_back(std::make_shared<mira_icu>(path_));
 }
 
-bool mira_dataset::compatible_schema(const mira_dataset& other) const
-{
+bool mira_dataset::compatible_schema(const mira_dataset& other) const {
     return std::equal(components_.begin(), components_.end(), other.components_.begin(),
         other.components_.end(),
         [](const auto& mine, const auto& theirs) { return mine->compatible_schema(*theirs); });
 }
 
-void mira_dataset::make_current() const
-{
+void mira_dataset::make_current() const {
     for (const auto& component : components_) {
         component->make_current();
     }

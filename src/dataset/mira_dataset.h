@@ -13,8 +13,7 @@
 ///
 /// There is no order among datasets beside their equality: two datasets of the same version in
 /// different directories are different, and neither is newer.
-class mira_dataset
-{
+class mira_dataset {
 public:
     /// Builds the dataset in the directory `path`, which must be named below "/var/db/timezone/tz/"
     /// but need not exist; its version text is the rest of the path. The empty path is the system

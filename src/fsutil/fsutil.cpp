@@ -5,8 +5,7 @@
 #include <err.h>
 #include <unistd.h>
 
-void fsutil::remove(const std::string& path)
-{
+void fsutil::remove(const std::string& path) {
     if (::unlink(path.c_str()) != 0 && errno != ENOENT) {
         const int error = errno;
         warn("remove: could not remove %s", path.c_str());
@@ -14,13 +13,11 @@ void fsutil::remove(const std::string& path)
     }
 }
 
-bool fsutil::exists(const std::string& path)
-{
+bool fsutil::exists(const std::string& path) {
     return ::access(path.c_str(), F_OK) == 0;
 }
 
-std::string fsutil::read_symlink(const std::string& path)
-{
+std::string fsutil::read_symlink(const std::string& path) {
     char text[1025];
     const ssize_t length = ::readlink(path.c_str(), text, sizeof text - 1);
     if (length >= 0) {
@@ -35,8 +32,7 @@ std::string fsutil::read_symlink(const std::string& path)
     throw error;
 }
 
-void fsutil::create_symlink(const std::string& target, const std::string& link_path)
-{
+void fsutil::create_symlink(const std::string& target, const std::string& link_path) {
     if (::symlink(target.c_str(), link_path.c_str()) != 0) {
         const int error = errno;
         warn("create_symlink: from %s to %s", link_path.c_str(), target.c_str());

@@ -6,8 +6,7 @@
 ///
 /// A failure has one shape: a single warning that names the operation and the path, then the
 /// `errno` of the failed call thrown as an `int`. A failed call has changed nothing on disk.
-namespace fsutil
-{
+namespace fsutil {
 
 /// Removes the file or link at `path` (a link itself, never what it points at; never a directory).
 /// A missing path is no failure.

@@ -5,8 +5,7 @@
 #include <cstdarg>
 
 int open_dprotected_np(
-    const char* path, int flags, int /*protection_class*/, int protection_options, ...)
-{
+    const char* path, int flags, int /*protection_class*/, int protection_options, ...) {
     int permissions = 0;
     if ((flags & O_CREAT) != 0) {
         va_list arguments;

@@ -8,8 +8,7 @@
 /// traits a bracket asks the locale about each of the 256 bytes when an expression is compiled.
 struct byte_regex_traits : std::regex_traits<char> {
     template <typename Iterator>
-    std::string transform_primary(Iterator /*first*/, Iterator /*last*/) const
-    {
+    std::string transform_primary(Iterator /*first*/, Iterator /*last*/) const {
         return {};
     }
 

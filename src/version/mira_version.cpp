@@ -4,24 +4,20 @@
 
 #include <err.h>
 
-namespace
-{
+namespace {
 
 /// Returns the value of a group of digits, or -1 for a group that took no part in the match.
-int number_or_absent(const std::ssub_match& digits)
-{
+int number_or_absent(const std::ssub_match& digits) {
     return digits.matched ? std::stoi(digits.str()) : -1;
 }
 
 } // namespace
 
-mira_version::mira_version(const std::string& text)
-{
+mira_version::mira_version(const std::string& text) {
     parse(text);
 }
 
-void mira_version::parse(const std::string& text)
-{
+void mira_version::parse(const std::string& text) {
     const byte_regex grammar(R"(([0-9]+)([a-z]+)(?:\.([0-9]+))?(?:\.([0-9]+))?)", unlimited_text);
     std::smatch results;
     if (!std::regex_match(text, results, grammar)) {

@@ -17,13 +17,11 @@
 
 namespace fs = std::filesystem;
 
-namespace
-{
+namespace {
 
 /// Enters a private mount namespace, as root of a user namespace where the caller is not root.
 /// Returns 0 or the errno of the refusal.
-int enter_namespace()
-{
+int enter_namespace() {
     const std::string user = std::to_string(::geteuid());
     const std::string group = std::to_string(::getegid());
     if (::unshare(user == "0" ? CLONE_NEWNS : CLONE_NEWNS | CLONE_NEWUSER) != 0) {
@@ -39,8 +37,7 @@ int enter_namespace()
 
 } // namespace
 
-void device::renew()
-{
+void device::renew() {
     static const int refusal = enter_namespace();
     if (refusal != 0 && std::getenv("CI") == nullptr) {
         GTEST_SKIP() << "the kernel refuses a mount namespace: " << std::strerror(refusal);
@@ -57,41 +54,35 @@ void device::renew()
     make_directory(paths::dataset_root);
 }
 
-void make_file(const std::string& path, const std::string& content, mode_t mode)
-{
+void make_file(const std::string& path, const std::string& content, mode_t mode) {
     remove_all(path);
     fs::create_directories(fs::path(path).parent_path());
     std::ofstream(path, std::ios::binary) << content;
     fs::permissions(path, fs::perms(mode));
 }
 
-void make_directory(const std::string& path)
-{
+void make_directory(const std::string& path) {
     remove_all(path);
     fs::create_directories(path);
 }
 
-void make_link(const std::string& path, const std::string& text)
-{
+void make_link(const std::string& path, const std::string& text) {
     remove_all(path);
     fs::create_directories(fs::path(path).parent_path());
     fs::create_symlink(text, path);
 }
 
-void remove_all(const std::string& path)
-{
+void remove_all(const std::string& path) {
     fs::remove_all(path);
 }
 
-void install_system(const std::string& version, const std::string& format)
-{
+void install_system(const std::string& version, const std::string& format) {
     make_file("/usr/share/zoneinfo.default/+VERSION", version + "\n");
     make_file("/usr/share/zoneinfo.default/Asia/Tokyo");
     make_file("/usr/share/icu/icutzformat.txt", format + "\n");
 }
 
-std::string install_update(const std::string& version, const std::string& format)
-{
+std::string install_update(const std::string& version, const std::string& format) {
     std::string directory = "/var/db/timezone/tz/" + version;
     make_directory(directory + "/zoneinfo");
     if (!format.empty()) {
@@ -100,8 +91,7 @@ std::string install_update(const std::string& version, const std::string& format
     return directory;
 }
 
-void link_data(const std::string& dataset)
-{
+void link_data(const std::string& dataset) {
     remove_all(paths::icu_link);
     if (dataset.empty()) {
         make_link(paths::zoneinfo_link, "/usr/share/zoneinfo.default");
@@ -111,8 +101,7 @@ void link_data(const std::string& dataset)
     }
 }
 
-std::string entry(const std::string& path)
-{
+std::string entry(const std::string& path) {
     const fs::file_status status = fs::symlink_status(path);
     if (fs::is_symlink(status)) {
         return "-> " + fs::read_symlink(path).string();
@@ -124,8 +113,7 @@ std::string entry(const std::string& path)
     return fs::exists(status) ? "directory" : "nothing";
 }
 
-void check_data_links(const std::string& dataset)
-{
+void check_data_links(const std::string& dataset) {
     const bool system = dataset.empty();
     EXPECT_EQ(entry(paths::zoneinfo_link),
         system ? "-> /usr/share/zoneinfo.default" : "-> " + dataset + "/zoneinfo");

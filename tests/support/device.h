@@ -11,8 +11,7 @@ using strings = std::vector<std::string>;
 /// A fresh device for each test, at the real absolute paths: an empty "/usr/share" and a "/var"
 /// with an empty "/var/db/timezone/tz", mounted in a namespace of the test's own. Where the kernel
 /// refuses the namespace, the test is skipped; it fails when the variable CI is set.
-class device : public testing::Test
-{
+class device : public testing::Test {
 protected:
     void SetUp() override { renew(); }
 

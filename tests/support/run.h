@@ -5,22 +5,20 @@
 #include <functional>
 #include <string>
 
-/// Returns the line of a warning about a call that has just failed with `error`. A line without an
-/// errno's text is expected with any: where no call has just failed, what stands there is left
-/// over from an earlier one.
+/// Returns a warning with the text of the errno of the call that has just failed. A warning that is
+/// expected without one may show any: what stands there is left over from an earlier call.
 std::string failed(const std::string& warning, int error);
 /// Returns the warnings about a version text that is refused.
 strings refused(const std::string& version);
 strings operator+(strings left, const strings& right);
 
-/// What an action throws: an `int`, or one of the two standard errors.
-constexpr int nothing = 0;
+/// What an action throws, beside an `int`.
 constexpr int badpath = -2;
 constexpr int out_of_range = -3;
 
 /// Runs `action` in this process and checks its warnings, in order, and what it throws.
 void check_action(
-    const std::function<void()>& action, const strings& warnings = {}, int thrown = nothing);
+    const std::function<void()>& action, const strings& warnings = {}, int thrown = 0);
 
 /// Starts the built program and checks that it ends with `status`, prints nothing and writes the
 /// warnings. `prepare` runs in the child before it.
@@ -35,8 +33,8 @@ struct system_call {
     strings paths;
 };
 
-/// Says what becomes of a call: 0 lets it pass, an errno makes it fail without being done (x86-64
-/// only), and `kill_before` ends the program by SIGKILL.
+/// Says what becomes of a call: 0 lets it pass, an errno makes it fail without being done, and
+/// `kill_before` ends the program by SIGKILL.
 using judge = std::function<int(const system_call&)>;
 constexpr int kill_before = -1;
 
