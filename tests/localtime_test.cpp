@@ -53,14 +53,13 @@ TEST_F(localtime_link, is_kept_corrected_or_reset) {
     EXPECT_EQ(entry(place), "-> " + default_link);
 }
 
-TEST_F(localtime_link, takes_the_place_of_what_can_be_deleted) {
-    const strings warnings = {failed("read_symlink: " + place, EINVAL), failed(reset, EINVAL)};
-    make_file(place);
-    check_action(repair_localtime_link, warnings);
-    EXPECT_EQ(entry(place), "-> " + default_link);
-    make_directory(place);
-    check_action(repair_localtime_link, warnings);
-    EXPECT_EQ(entry(place), "-> " + default_link);
+TEST_F(localtime_link, takes_the_place_of_a_file_or_an_empty_directory) {
+    for (const auto& make : {+[] { make_file(place); }, +[] { make_directory(place); }}) {
+        make();
+        check_action(repair_localtime_link,
+            {failed("read_symlink: " + place, EINVAL), failed(reset, EINVAL)});
+        EXPECT_EQ(entry(place), "-> " + default_link);
+    }
 }
 
 TEST_F(localtime_link, throws_when_even_the_default_link_cannot_be_created) {
