@@ -61,7 +61,7 @@ void reset_to_system_partition() {
     system.make_current();
 }
 
-void touch_cleanup_marker() {
+void touch_cleanup_marker() noexcept {
     const int marker = open_dprotected_np(paths::cleanup_marker, O_RDWR | O_CREAT, 4, 0, 0666);
     bool touched = false;
     if (marker != -1) {
@@ -74,7 +74,7 @@ void touch_cleanup_marker() {
     }
 }
 
-void write_version_diff_record(const mira_dataset& active, const mira_dataset& latest) {
+void write_version_diff_record(const mira_dataset& active, const mira_dataset& latest) noexcept {
     try {
         std::ofstream record(paths::version_record);
         record << active.version_string() << '_' << latest.version_string();

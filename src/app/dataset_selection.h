@@ -20,10 +20,10 @@ void select_dataset();
 void reset_to_system_partition();
 
 /// Creates the clean-up marker, an empty file that says that an updated dataset was given up. A
-/// marker that exists is left unchanged. Never throws; a failure warns "Cannot touch file %s".
-void touch_cleanup_marker();
+/// marker that exists is left unchanged. A failure warns "Cannot touch file %s".
+void touch_cleanup_marker() noexcept;
 
 /// Writes the version record, whole and without a line end: the version text of `active`, the
-/// dataset in use before the switch, an underscore, and that of `latest`. Neither throws nor
-/// reports: the record is news for others, and the switch is done.
-void write_version_diff_record(const mira_dataset& active, const mira_dataset& latest);
+/// dataset in use before the switch, an underscore, and that of `latest`. Reports
+/// no failure: the record is news for others, and the switch is done.
+void write_version_diff_record(const mira_dataset& active, const mira_dataset& latest) noexcept;

@@ -5,12 +5,12 @@
 
 #include <unistd.h>
 
-void prepare_timezone_directories() {
+void prepare_timezone_directories() noexcept {
     set_directory_protection_class(paths::timezone_directory);
     set_directory_protection_class(paths::dataset_root);
 }
 
-void set_directory_protection_class(const char* path) {
+void set_directory_protection_class(const char* path) noexcept {
     const int directory = ::open(path, O_RDONLY | O_CLOEXEC);
     if (directory == -1) {
         return;

@@ -19,8 +19,7 @@ public:
     virtual void make_current() const = 0;
 
 protected:
-    mira_dataset_component() = default;
-    explicit mira_dataset_component(std::string dataset_path)
+    explicit mira_dataset_component(std::string dataset_path = {})
         : dataset_path_(std::move(dataset_path)) {}
     ~mira_dataset_component() = default;
 
