@@ -24,6 +24,6 @@ void reset_to_system_partition();
 void touch_cleanup_marker() noexcept;
 
 /// Writes the version record, whole and without a line end: the version text of `active`, the
-/// dataset in use before the switch, an underscore, and that of `latest`. Reports
-/// no failure: the record is news for others, and the switch is done.
+/// dataset in use before the switch, an underscore, and that of `latest`. Reports no failure: the
+/// record is news for others, and the switch is done.
 void write_version_diff_record(const mira_dataset& active, const mira_dataset& latest) noexcept;
