@@ -36,6 +36,9 @@ TEST(version, is_unset_by_a_text_that_is_refused) {
         check_action([&] { version.parse(text); }, refused(text));
         EXPECT_EQ(version, mira_version()) << text;
     }
+    const std::tuple<int, std::string, int, int> unset = {-1, "", -1, -1};
+    const mira_version version;
+    EXPECT_EQ(std::tie(version.year, version.letters, version.major, version.minor), unset);
     const std::string upper_case(1'000'000, 'A');
     check_action([&] { mira_version{"2016" + upper_case}; }, refused("2016" + upper_case));
     EXPECT_EQ(
