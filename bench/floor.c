@@ -16,23 +16,20 @@ static const char warning[] =
 static char buffer[32768];
 static struct stat status;
 
-static void set_protection_class(const char *path)
-{
+static void set_protection_class(const char* path) {
     const int directory = open(path, O_RDONLY | O_CLOEXEC);
     fcntl(directory, 64, 4);
     close(directory);
 }
 
-static void read_file(const char *path)
-{
+static void read_file(const char* path) {
     const int file = open(path, O_RDONLY);
     read(file, buffer, 8191);
     close(file);
 }
 
 /* What the walk of a directory that holds one data file comes down to. */
-static void walk(const char *root)
-{
+static void walk(const char* root) {
     stat(root, &status);
     const int start = open(".", O_RDONLY);
     fchdir(start);
@@ -48,8 +45,7 @@ static void walk(const char *root)
     close(start);
 }
 
-static void switch_links(void)
-{
+static void switch_links(void) {
     unlink(TIMEZONE "zoneinfo");
     symlink(LATEST "/zoneinfo", TIMEZONE "zoneinfo");
     unlink("/var/db/icutz");
@@ -62,8 +58,7 @@ static void switch_links(void)
     close(file);
 }
 
-int main(int count, char **arguments)
-{
+int main(int count, char** arguments) {
     signal(SIGPIPE, SIG_IGN);
     set_protection_class(TIMEZONE);
     set_protection_class(TIMEZONE "tz/");

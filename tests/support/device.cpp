@@ -108,7 +108,8 @@ std::string entry(const std::string& path) {
     }
     if (fs::is_regular_file(status)) {
         std::ifstream file(path, std::ios::binary);
-        return "[" + std::string(std::istreambuf_iterator<char>(file), {}) + "]";
+        const std::string content(std::istreambuf_iterator<char>(file), {});
+        return "[" + content + "]";
     }
     return fs::exists(status) ? "directory" : "nothing";
 }
