@@ -108,8 +108,7 @@ std::string entry(const std::string& path) {
     }
     if (fs::is_regular_file(status)) {
         std::ifstream file(path, std::ios::binary);
-        const std::string content(std::istreambuf_iterator<char>(file), {});
-        return "[" + content + "]";
+        return "[" + std::string(std::istreambuf_iterator<char>(file), {}) + "]";
     }
     return fs::exists(status) ? "directory" : "nothing";
 }
