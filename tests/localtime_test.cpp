@@ -66,7 +66,7 @@ TEST_F(localtime_link, throws_when_even_the_default_link_cannot_be_created) {
     install_system();
     link_data("");
     make_link(place, "/usr/share/zoneinfo/Asia/Tokyo");
-    ASSERT_EQ(::mount(nullptr, "/var", nullptr, MS_REMOUNT | MS_RDONLY, nullptr), 0);
+    ASSERT_EQ(::mount("tmpfs", "/var", "tmpfs", MS_REMOUNT | MS_RDONLY, nullptr), 0);
     const std::string corrected = "/var/db/timezone/zoneinfo/Asia/Tokyo";
     check_action(repair_localtime_link,
         {correcting + corrected, failed(create + corrected, EEXIST), failed(reset, EEXIST),

@@ -32,7 +32,7 @@ int enter_namespace() {
         std::ofstream("/proc/self/uid_map") << "0 " + user + " 1";
         std::ofstream("/proc/self/gid_map") << "0 " + group + " 1";
     }
-    return ::mount(nullptr, "/", nullptr, MS_REC | MS_PRIVATE, nullptr) == 0 ? 0 : errno;
+    return ::mount("none", "/", "none", MS_REC | MS_PRIVATE, nullptr) == 0 ? 0 : errno;
 }
 
 } // namespace
