@@ -60,6 +60,7 @@ static void switch_links(void) {
 
 int main(int count, char** arguments) {
     signal(SIGPIPE, SIG_IGN);
+    signal(SIGXFSZ, SIG_IGN);
     set_protection_class(TIMEZONE);
     set_protection_class(TIMEZONE "tz/");
     unlink(TIMEZONE "needs_cleanup");

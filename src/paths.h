@@ -1,7 +1,7 @@
 #pragma once
 
-/// The system's paths, all of them, with the names that the system uses for them. They are compiled
-/// in: there is no option, variable or file that changes one.
+/// The system's paths, with the names that the system uses for them. They are compiled in: there is
+/// no option, variable or file that changes one.
 namespace paths {
 
 // The read-only system partition.

@@ -6,6 +6,7 @@
 #include <string>
 
 #include <fcntl.h>
+#include <sys/resource.h>
 #include <sys/stat.h>
 #include <sys/syscall.h>
 #include <unistd.h>
@@ -90,6 +91,15 @@ TEST_F(program, does_its_work_whatever_becomes_of_its_standard_streams) {
         check_start({}, 0, prepare);
         check_done();
     }
+}
+
+TEST_F(program, goes_on_when_no_file_may_grow) {
+    check_start({}, 0, [] {
+        const rlimit none = {0, 0};
+        ::setrlimit(RLIMIT_FSIZE, &none);
+    });
+    EXPECT_EQ(entry(paths::version_record), "[]");
+    EXPECT_EQ(entry(paths::localtime_link), "-> /var/db/timezone/zoneinfo/America/Los_Angeles");
 }
 
 TEST_F(program, deletes_what_earlier_starts_left) {

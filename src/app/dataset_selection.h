@@ -10,12 +10,12 @@ class mira_dataset;
 /// ("Symlink points at data incompatible with installed system"). A latest dataset that is not
 /// taken is reported ("New update not compatible or older version"); no latest link is no failure.
 ///
-/// Throws what reading the latest link, building a dataset or switching a link throws, after its
-/// warning; links that were switched by then stay so.
+/// Throws what reading the latest link, building a dataset or switching a link throws; links that
+/// were switched by then stay so.
 void select_dataset();
 
 /// Makes the system dataset current: the zoneinfo link names "/usr/share/zoneinfo.default" and the
-/// ICU link is gone. Has no warning of its own and leaves the clean-up marker alone.
+/// ICU link is removed. Has no warning of its own and leaves the clean-up marker alone.
 /// Throws what building the system dataset or switching a link throws.
 void reset_to_system_partition();
 

@@ -10,5 +10,5 @@
 /// %s"). Texts are compared as stored: nothing is resolved.
 ///
 /// Throws, with the warning of `fsutil::create_symlink` written, only when even the default link
-/// cannot be created; no local-time link exists then.
+/// cannot be created.
 void repair_localtime_link();

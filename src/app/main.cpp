@@ -23,6 +23,6 @@ int main() try {
     repair_localtime_link();
     return 0;
 } catch (...) {
-    // What failed has been reported, and nothing is left to fall back to.
+    // Nothing is left to fall back to; the last warning says what was tried.
     return 1;
 }

@@ -13,8 +13,8 @@ public:
     /// Returns whether this component's data has a format that readers of `other`'s data can read.
     virtual bool compatible_schema(const mira_dataset_component& other) const = 0;
 
-    /// Points the system-wide link for this kind of data at this component's data. The old link is
-    /// removed first; in between there is none.
+    /// Puts the system-wide link for this kind of data in order: removes the old one, then creates
+    /// the one that this component's data wants.
     /// Throws what `fsutil::create_symlink` throws, after its warning.
     virtual void make_current() const = 0;
 

@@ -33,8 +33,8 @@ file_walk open_walk(std::string root) {
     return walk;
 }
 
-/// Returns whether the walk's entry is a regular file directly inside the root that everyone may
-/// read.
+/// Returns whether the walk's entry is a regular file directly inside the root that users other
+/// than its owner and group may read.
 bool may_be_data_file(const FTSENT& entry) {
     return entry.fts_errno == 0 && entry.fts_level == 1 && entry.fts_namelen != 0 &&
            entry.fts_info == FTS_F && (entry.fts_statp->st_mode & S_IROTH) != 0;

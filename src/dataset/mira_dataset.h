@@ -11,8 +11,8 @@
 /// before ICU. Building a dataset reads what is installed and writes nothing; afterwards it does
 /// not change.
 ///
-/// There is no order among datasets beside their equality: two datasets of the same version in
-/// different directories are different, and neither is newer.
+/// Datasets are equal by directory and ordered by version: two of the same version in different
+/// directories are different, and neither is newer.
 class mira_dataset {
 public:
     /// Builds the dataset in the directory `path`, which must be named below "/var/db/timezone/tz/"

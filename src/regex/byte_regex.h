@@ -16,7 +16,7 @@ struct byte_regex_traits : std::regex_traits<char> {
 };
 
 /// An ECMAScript expression over bytes. It must not hold a character class (`\d`, `[:alpha:]`) or
-/// an equivalence class, which never match.
+/// an equivalence class (`[=a=]`), which are not told apart.
 using byte_regex = std::basic_regex<char, byte_regex_traits>;
 
 /// The flags for an expression that is matched against text without a length limit. The default
