@@ -9,8 +9,8 @@
 using strings = std::vector<std::string>;
 
 /// A fresh device for each test, at the real absolute paths: an empty "/usr/share" and a "/var"
-/// with an empty "/var/db/timezone/tz", mounted in a namespace of the test's own. Where the kernel
-/// refuses the namespace, the test is skipped; it fails when the variable CI is set.
+/// with an empty "/var/db/timezone/tz", mounted in a namespace of the test's own. Where that is
+/// refused, the process ends at once with a failure, before anything of the machine is touched.
 class device : public testing::Test {
 protected:
     void SetUp() override { renew(); }
