@@ -6,6 +6,7 @@
 
 #include <cerrno>
 #include <cstring>
+#include <ctime>
 #include <fstream>
 #include <memory>
 
@@ -20,11 +21,16 @@ struct walk_closer {
 };
 using file_walk = std::unique_ptr<FTS, walk_closer>;
 
+/// Where a `long` is too short for a date, the GNU C library's walk fails to change into a
+/// directory dated after 2038, so it stays where it is.
+constexpr int stay_in_place = sizeof(long) < sizeof(std::time_t) ? FTS_NOCHDIR : 0;
+
 /// Opens a walk that follows no link but `root` itself and stays on its file system. Entries come
 /// in the order in which the file system lists them.
 file_walk open_walk(std::string root) {
     char* const roots[] = {root.data(), nullptr};
-    file_walk walk(::fts_open(roots, FTS_COMFOLLOW | FTS_PHYSICAL | FTS_XDEV, nullptr));
+    constexpr int options = FTS_COMFOLLOW | FTS_PHYSICAL | FTS_XDEV | stay_in_place;
+    file_walk walk(::fts_open(roots, options, nullptr));
     if (walk == nullptr) {
         const int error = errno;
         warn("tz_icu::initialize: fts_open of %s failed, %s", root.c_str(), std::strerror(error));
