@@ -1,94 +1,104 @@
 #include "components/mira_icu.h"
 #include "components/mira_zoneinfo.h"
-#include "paths.h"
-#include "support/run.h"
+#include "warnings.h"
 
-#include <cerrno>
 #include <cstring>
 #include <filesystem>
+#include <fstream>
 #include <string>
+
+#include <stdlib.h>
+
+namespace fs = std::filesystem;
 
 namespace {
 
-using zoneinfo = device;
-using icu = device;
+/// A directory of its own for a dataset, at first without any data.
+struct dataset {
+    dataset() { EXPECT_NE(::mkdtemp(path.data()), nullptr); }
+    ~dataset() { fs::remove_all(path); }
 
-const std::string dataset = "/var/db/timezone/tz/2016f.1.0";
-const std::string icu_directory = dataset + "/icutz/";
-
-/// Checks the format of the data in `dataset` beside a system of that format and of another.
-void check_format(const std::string& format) {
-    for (const std::string& system : {format, format + "x"}) {
-        make_file("/usr/share/icu/icutzformat.txt", system.empty() ? "\n" : " " + system + " more");
-        check_action([&] {
-            EXPECT_EQ(mira_icu(dataset).compatible_schema(mira_icu()), system == format) << system;
-        });
+    void make_file(const std::string& name, const std::string& content = {}) const {
+        fs::create_directories(fs::path(path + name).parent_path());
+        std::ofstream(path + name) << content;
     }
+
+    std::string path = testing::TempDir() + "mira_tests.XXXXXX";
+};
+
+/// Checks that the data has the ICU format `format`, none where it is empty.
+void check_format(const dataset& data, const std::string& format) {
+    const dataset same;
+    same.make_file(format.empty() ? "/icutz/none" : "/icutz/icutz" + format + ".dat");
+    EXPECT_TRUE(mira_icu(data.path).compatible_schema(mira_icu(same.path))) << format;
 }
 
 } // namespace
 
-TEST_F(zoneinfo, version_is_the_first_word_of_its_file) {
+TEST(zoneinfo, version_is_the_first_word_of_its_file) {
+    const dataset data;
+    EXPECT_EQ(mira_zoneinfo(data.path).version_string(), "");
     const std::string long_word(70'000, 'x');
     const std::pair<std::string, std::string> contents[] = {{"2016f\n", "2016f"},
-        {" \t\v\f\r\n2016f extra\n", "2016f"}, {long_word + "\v\xff", long_word}, {"", ""},
-        {" \n\t", ""}};
+        {" \t\v\f\r\n2016f extra\n", "2016f"}, {long_word + "\v\xff", long_word}, {" \n\t", ""}};
     for (const auto& [content, word] : contents) {
-        make_file("/usr/share/zoneinfo.default/+VERSION", content);
-        check_action([word = word] { EXPECT_EQ(mira_zoneinfo().version_string(), word); });
+        data.make_file("/zoneinfo/+VERSION", content);
+        EXPECT_EQ(mira_zoneinfo(data.path).version_string(), word);
     }
-    make_directory(dataset + "/zoneinfo/+VERSION");
-    check_action([] { EXPECT_EQ(mira_zoneinfo(dataset).version_string(), ""); });
-    make_file(dataset + "/zoneinfo/+VERSION", "2016f");
-    check_action([] { EXPECT_EQ(mira_zoneinfo(dataset).version_string(), "2016f"); });
 }
 
-TEST_F(icu, format_is_in_the_name_of_a_regular_file_that_everyone_may_read) {
-    check_format("");
+TEST(icu, format_is_in_the_name_of_a_regular_file_that_everyone_may_read) {
+    const dataset data;
+    check_format(data, "");
     for (const std::string name : {"icutz44L.dat", "icutz44x.dat", "icutzl.dat", "icutz44.dat",
-             "icutz44l.dat.bak", "xicutz44l.dat", "icutz44l.DAT", "icutz44lxdat", "icutz/l.dat",
-             "icutz:l.dat", "icutz4\xb2l.dat", "below/icutz44l.dat", "below/below/icutz44l.dat"}) {
-        make_file(icu_directory + name);
+             "icutz44l.dat.bak", "xicutz44l.dat", "icutz44l.DAT", "icutz44lxdat", "icutz:l.dat",
+             "icutz4\xb2l.dat", "icutz/l.dat", "below/icutz44l.dat", "below/below/icutz44l.dat"}) {
+        data.make_file("/icutz/" + name);
     }
-    make_file(icu_directory + "icutz45l.dat", "", 0770);
-    make_file("/var/icutz46l.dat");
-    make_link(icu_directory + "icutz46l.dat", "/var/icutz46l.dat");
-    make_directory(icu_directory + "icutz47l.dat");
-    check_format("");
+    data.make_file("/icutz/icutz45l.dat");
+    fs::permissions(data.path + "/icutz/icutz45l.dat", fs::perms(0770));
+    fs::create_symlink("icutzl.dat", data.path + "/icutz/icutz46l.dat");
+    fs::create_directory(data.path + "/icutz/icutz47l.dat");
+    check_format(data, "");
     for (const std::string format : {"44l", "2015b", "0e", "9l"}) {
-        make_file(icu_directory + "icutz" + format + ".dat", "", 0004);
-        check_format(format);
-        remove_all(icu_directory + "icutz" + format + ".dat");
+        const std::string name = "/icutz/icutz" + format + ".dat";
+        data.make_file(name);
+        fs::permissions(data.path + name, fs::perms(0004));
+        check_format(data, format);
+        fs::remove(data.path + name);
     }
 }
 
-TEST_F(icu, format_is_that_of_the_first_file_that_the_directory_lists) {
-    for (const std::string format : {"44l", "45b", "46e"}) {
-        make_file(icu_directory + "icutz" + format + ".dat");
+TEST(icu, format_is_that_of_the_first_file_that_the_directory_lists) {
+    const dataset data;
+    for (const std::string format : {"44l", "45b", "46e", "47l"}) {
+        data.make_file("/icutz/icutz" + format + ".dat");
     }
-    const std::filesystem::directory_iterator first(icu_directory);
-    check_format(first->path().filename().string().substr(5, 3));
+    const fs::directory_iterator first(data.path + "/icutz");
+    check_format(data, first->path().filename().string().substr(5, 3));
 }
 
-TEST_F(icu, directory_may_be_a_link) {
-    make_file("/var/elsewhere/icutz44l.dat");
-    make_link(dataset + "/icutz", "/var/elsewhere");
-    check_format("44l");
-    make_link(dataset + "/icutz", "icutz");
-    check_format("");
+TEST(icu, directory_may_be_a_link) {
+    const dataset data;
+    data.make_file("/elsewhere/icutz44l.dat");
+    fs::create_symlink("elsewhere", data.path + "/icutz");
+    check_format(data, "44l");
+    fs::remove(data.path + "/icutz");
+    fs::create_symlink("icutz", data.path + "/icutz");
+    check_format(data, "");
 }
 
-TEST_F(icu, directory_that_cannot_be_walked_throws_enametoolong) {
+TEST(icu, directory_that_cannot_be_walked_is_an_error) {
     const std::string path(70'000, 'x'); // longer than the walk can hold
-    const std::string text = std::strerror(ENAMETOOLONG);
-    check_action([&] { mira_icu{path}; },
-        {failed(
-            "tz_icu::initialize: fts_open of " + path + "/icutz failed, " + text, ENAMETOOLONG)},
-        ENAMETOOLONG);
+    const std::string text = "tz_icu::initialize: fts_open of " + path + "/icutz failed, ";
+    EXPECT_EQ(warnings([&] { EXPECT_THROW(mira_icu{path}, int); }),
+        warning(text + std::strerror(ENAMETOOLONG), ENAMETOOLONG));
 }
 
-TEST_F(icu, is_compatible_with_icu_data_only) {
-    check_action([] { EXPECT_FALSE(mira_icu().compatible_schema(mira_zoneinfo())); },
-        {"mira_icu::compatible_schema: could not dynamic_cast other component"});
-    check_action([] { EXPECT_TRUE(mira_zoneinfo().compatible_schema(mira_icu())); });
+TEST(icu, is_compatible_with_icu_data_only) {
+    const mira_icu icu_data("");
+    const mira_zoneinfo zoneinfo_data("");
+    EXPECT_EQ(warnings([&] { EXPECT_FALSE(icu_data.compatible_schema(zoneinfo_data)); }),
+        warning("mira_icu::compatible_schema: could not dynamic_cast other component"));
+    EXPECT_TRUE(zoneinfo_data.compatible_schema(icu_data));
 }
