@@ -2,13 +2,13 @@
 
 #include "fsutil/fsutil.h"
 #include "paths.h"
-#include "regex/byte_regex.h"
 
 #include <cerrno>
 #include <cstring>
 #include <ctime>
 #include <fstream>
 #include <memory>
+#include <regex>
 
 #include <err.h>
 #include <fts.h>
@@ -69,14 +69,15 @@ void mira_icu::read_system_format() {
 
 /// Takes the format from the name of the first data file that the directory lists.
 void mira_icu::find_format() {
-    const byte_regex data_file_name(R"(icutz([0-9]+[lbe])\.dat)");
+    // Over wide characters, as in mira_version.cpp.
+    const std::wregex data_file_name(LR"(icutz([0-9]+[lbe])\.dat)");
     const file_walk walk = open_walk(icu_path_);
     const FTSENT* entry = nullptr;
     while (format_.empty() && (entry = ::fts_read(walk.get())) != nullptr) {
-        std::cmatch match;
-        const char* const name = entry->fts_name;
+        const std::wstring name(entry->fts_name, entry->fts_name + entry->fts_namelen);
+        std::wsmatch match;
         if (may_be_data_file(*entry) && std::regex_match(name, match, data_file_name)) {
-            format_ = match.str(1);
+            format_.assign(match[1].first, match[1].second);
         }
     }
 }
