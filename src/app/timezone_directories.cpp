@@ -1,14 +1,11 @@
 #include "app/timezone_directories.h"
 
+#include "data_protection.h"
 #include "paths.h"
-#include "platform/data_protection.h"
 
 #include <unistd.h>
 
-void prepare_timezone_directories() noexcept {
-    set_directory_protection_class(paths::timezone_directory);
-    set_directory_protection_class(paths::dataset_root);
-}
+namespace {
 
 void set_directory_protection_class(const char* path) noexcept {
     const int directory = ::open(path, O_RDONLY | O_CLOEXEC);
@@ -16,6 +13,13 @@ void set_directory_protection_class(const char* path) noexcept {
         return;
     }
     // A class that cannot be set must not keep the device from its time zone: results are ignored.
-    ::fcntl(directory, F_SETPROTECTIONCLASS, 4);
+    ::fcntl(directory, F_SETPROTECTIONCLASS, timezone_protection_class);
     ::close(directory);
+}
+
+} // namespace
+
+void prepare_timezone_directories() noexcept {
+    set_directory_protection_class(paths::timezone_directory);
+    set_directory_protection_class(paths::dataset_root);
 }
