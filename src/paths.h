@@ -7,7 +7,8 @@ namespace paths {
 // The read-only system partition.
 inline constexpr char system_zoneinfo[] = "/usr/share/zoneinfo.default";
 inline constexpr char system_icu[] = "/usr/share/icu";
-inline constexpr char read_only_zoneinfo[] = "/usr/share/zoneinfo";
+// Never opened: a local-time link into it is corrected, to follow the zoneinfo link.
+inline constexpr char correctable_zoneinfo[] = "/usr/share/zoneinfo";
 
 // Where updated datasets are installed, each in a directory named by its version text.
 inline constexpr char timezone_directory[] = "/var/db/timezone/";
@@ -18,6 +19,7 @@ inline constexpr char latest_link[] = "/var/db/timezone/tz_latest";
 inline constexpr char zoneinfo_link[] = "/var/db/timezone/zoneinfo";
 inline constexpr char icu_link[] = "/var/db/icutz";
 inline constexpr char localtime_link[] = "/var/db/timezone/localtime";
+inline constexpr char default_localtime[] = "/var/db/timezone/zoneinfo/America/Los_Angeles";
 
 // What a run leaves for other programs, and what it only ever deletes.
 inline constexpr char cleanup_marker[] = "/var/db/timezone/needs_cleanup";

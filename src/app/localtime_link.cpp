@@ -12,7 +12,6 @@
 namespace {
 
 constexpr char default_zone[] = "America/Los_Angeles";
-constexpr char default_zone_path[] = "/var/db/timezone/zoneinfo/America/Los_Angeles";
 
 void replace_localtime_link(const std::string& target) {
     // Of no interest: what could not be deleted fails the creation, which reports it.
@@ -23,7 +22,7 @@ void replace_localtime_link(const std::string& target) {
 /// Throws whenever the link can be neither kept nor corrected.
 void keep_or_correct_localtime_link() {
     constexpr int invalid_link = -1;
-    constexpr std::string_view correctable = paths::read_only_zoneinfo;
+    constexpr std::string_view correctable = paths::correctable_zoneinfo;
 
     const std::string zone_path = fsutil::read_symlink(paths::localtime_link);
     if (zone_path.starts_with(paths::zoneinfo_link)) {
@@ -48,6 +47,6 @@ void repair_localtime_link() {
         keep_or_correct_localtime_link();
     } catch (...) {
         warn("localtime link invalid; resetting to %s", default_zone);
-        replace_localtime_link(default_zone_path);
+        replace_localtime_link(paths::default_localtime);
     }
 }

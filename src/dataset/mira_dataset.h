@@ -24,7 +24,6 @@ public:
     /// components throw.
     explicit mira_dataset(const std::string& path = {});
 
-    const mira_version& version() const { return version_; }
     std::string version_string() const { return version_string_; }
 
     /// Returns whether both are the dataset in the same directory, byte for byte.
