@@ -2,13 +2,10 @@
 
 #include <csignal>
 #include <cstdio>
-#include <cstdlib>
-#include <exception>
 
 #include <limits.h>
 
 void prepare_process() {
-    std::set_terminate([] { std::_Exit(EXIT_FAILURE); });
     std::signal(SIGPIPE, SIG_IGN);
     std::signal(SIGXFSZ, SIG_IGN);
 

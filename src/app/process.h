@@ -4,8 +4,5 @@
 /// that other programs write to at the same time:
 /// - each line of a warning goes out in one write (one of more than PIPE_BUF bytes in several);
 /// - a reader of standard error that is gone, or a file that may not grow, is a failed write and
-/// not
-///   the end of the run;
-/// - a failure that nothing can handle, such as no memory for an exception, ends the process with
-///   status 1 and not by a signal.
+///   not the end of the run.
 void prepare_process();
