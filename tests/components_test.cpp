@@ -18,9 +18,11 @@ struct dataset {
     dataset() { EXPECT_NE(::mkdtemp(path.data()), nullptr); }
     ~dataset() { fs::remove_all(path); }
 
-    void make_file(const std::string& name, const std::string& content = {}) const {
+    void make_file(
+        const std::string& name, const std::string& content = {}, int mode = 0644) const {
         fs::create_directories(fs::path(path + name).parent_path());
         std::ofstream(path + name) << content;
+        fs::permissions(path + name, fs::perms(mode));
     }
 
     std::string path = testing::TempDir() + "mira_tests.XXXXXX";
@@ -55,15 +57,13 @@ TEST(icu, format_is_in_the_name_of_a_regular_file_that_everyone_may_read) {
              "icutz4\xb2l.dat", "icutz/l.dat", "below/icutz44l.dat", "below/below/icutz44l.dat"}) {
         data.make_file("/icutz/" + name);
     }
-    data.make_file("/icutz/icutz45l.dat");
-    fs::permissions(data.path + "/icutz/icutz45l.dat", fs::perms(0770));
+    data.make_file("/icutz/icutz45l.dat", "", 0770);
     fs::create_symlink("icutzl.dat", data.path + "/icutz/icutz46l.dat");
     fs::create_directory(data.path + "/icutz/icutz47l.dat");
     check_format(data, "");
     for (const std::string format : {"44l", "2015b", "0e", "9l"}) {
         const std::string name = "/icutz/icutz" + format + ".dat";
-        data.make_file(name);
-        fs::permissions(data.path + name, fs::perms(0004));
+        data.make_file(name, "", 0004);
         check_format(data, format);
         fs::remove(data.path + name);
     }
@@ -83,9 +83,6 @@ TEST(icu, directory_may_be_a_link) {
     data.make_file("/elsewhere/icutz44l.dat");
     fs::create_symlink("elsewhere", data.path + "/icutz");
     check_format(data, "44l");
-    fs::remove(data.path + "/icutz");
-    fs::create_symlink("icutz", data.path + "/icutz");
-    check_format(data, "");
 }
 
 TEST(icu, directory_that_cannot_be_walked_is_an_error) {
