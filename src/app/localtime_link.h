@@ -7,7 +7,7 @@
 /// "/usr/share/zoneinfo" is corrected to the same zone below the zoneinfo link ("Correcting
 /// localtime link to %s"). Any other link, a missing one and one that cannot be read or corrected
 /// are replaced by the default zone, America/Los_Angeles ("localtime link invalid; resetting to
-/// %s"). Texts are compared as stored: nothing is resolved.
+/// %s"). Only the first bytes of a text are compared, as stored: nothing is resolved.
 ///
 /// Throws, with the warning of `fsutil::create_symlink` written, only when even the default link
 /// cannot be created.

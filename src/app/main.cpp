@@ -11,7 +11,7 @@
 int main() try {
     prepare_process();
     prepare_timezone_directories();
-    // Left by earlier starts; what cannot be deleted stays.
+    // Left from before this start; what cannot be deleted stays.
     std::remove(paths::cleanup_marker);
     std::remove(paths::stale_icu);
     try {
