@@ -1,6 +1,6 @@
 # shellcheck shell=bash disable=SC2034
-# The words for devices: lay one out, start it, and compare what the start did with a promise. They
-# are read inside a device only, by in_device.sh, where paths are those of the system.
+# The words for devices: lay one out, start it, and compare what the start did with a promise.
+[[ -e /device.sh ]] || exit # in a device only, where paths are those of the system
 
 tz=/var/db/timezone zones=/var/db/timezone/zoneinfo
 default_zone=$zones/America/Los_Angeles
@@ -17,7 +17,7 @@ link() { mkdir -p "${1%/*}" && ln -sfn "$2" "$1"; }
 empty_device() { rm -rf var usr/share && mkdir -p usr/share var/db/timezone/tz; }
 
 # install_system VERSION, install_update VERSION [FORMAT]: the system's ICU format is 44l, and so is
-# an update's where no other is named. Each also holds what only the other's are to be read from.
+# an update's where no other is named. Each also holds decoys, which are read in the other only.
 install_system() {
     file /usr/share/zoneinfo.default/+VERSION "$1"$'\n'
     file /usr/share/zoneinfo.default/Asia/Tokyo
@@ -79,7 +79,7 @@ fact() { # NAME PATH
         is=$(readlink "$2")
     elif [[ -f $2 ]]; then
         is=$(cat "$2" && stat -c ', mode %a' "$2")
-        [[ -s $2 ]] || is=touched${is#$'\n'}
+        [[ -s $2 ]] || is=touched$is
         is=${is%, mode 644}
     elif [[ -e $2 ]]; then
         is='a directory'
@@ -95,7 +95,7 @@ others() {
 }
 
 # start WHAT [COMMAND...] <<PROMISE: starts the device, by COMMAND if there is one, and compares
-# what that did with the promise. A line of it is one of
+# what that did with the promise; the program ignores its argument. A line of a promise is one of
 #     warning TEXT          a warning, with whatever error text an earlier call has left
 #     failed TEXT: ERROR    a warning with the error of the call that has just failed
 #     zoneinfo TEXT         a fact that changes; those that are not named stay, like all else
@@ -130,7 +130,7 @@ start() {
 promises=0 failures=0
 compare() {
     promises=$((promises + 1))
-    diff -u promised seen >difference || failures=$((failures + 1))
+    diff -u --label promised --label seen promised seen >difference || failures=$((failures + 1))
     report "$1"
 }
 report() { [[ ! -s difference ]] || { echo "NOT AS PROMISED: $1" && cat difference; }; }

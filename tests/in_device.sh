@@ -1,9 +1,9 @@
 #!/usr/bin/env bash
 # in_device.sh PROGRAM SCRIPT [DIRECTORY FILE...]: makes a device, with PROGRAM in it, and runs
-# SCRIPT there, in the words of device.sh. The device is a new directory, DIRECTORY or one that is
-# removed afterwards, with copies of the FILEs and of the tools that a script needs; it is entered
-# by chroot. So nothing that a script does can reach what lies outside, and where chroot is refused
-# nothing is done at all.
+# SCRIPT there; that begins with `. /device.sh || exit`, which ends it wherever else it is run. The
+# device is a new directory, DIRECTORY or one that is removed afterwards, with copies of the FILEs
+# and of the tools that a script needs, and is entered by chroot: nothing that a script does can
+# reach what lies outside, and where chroot is refused nothing is done at all.
 set -euo pipefail
 umask 022
 PATH=$PATH:/usr/sbin # where chroot and zic lie, which only root searches
@@ -26,15 +26,13 @@ else
     device=$(mktemp -d "${program%/*}/device.XXXXXX")
     trap 'rm -rf --one-file-system "$device"' EXIT
 fi
-chmod 755 "$device"
 mkdir "$device"/{bin,dev,proc,tmp}
 touch "$device/dev/null" # which is empty too
 cp "$program" "$device/mira_tzlinks"
-cp "${0%/*}/device.sh" "$device"
+cp "${0%/*}/device.sh" "${@:4}" "$device"
 cat "$script" >"$device/script"
-[[ $# -lt 4 ]] || cp "${@:4}" "$device"
-for tool in awk bash cat chmod cp date diff env find grep ln mkdir mkfifo readlink rm sed sort stat \
-    strace touch tr xargs zic; do
+for tool in awk bash cat chmod cp date diff env find grep ln mkdir mkfifo readlink rm sed sort \
+    stat strace touch tr xargs zic; do
     cp -L "$(command -v $tool)" "$device/bin"
 done
 for library in $(ldd "$program" "$device"/bin/* | grep -Eo '/[^ ]+\.so[^ ]*' | sort -u); do
@@ -43,7 +41,7 @@ for library in $(ldd "$program" "$device"/bin/* | grep -Eo '/[^ ]+\.so[^ ]*' | s
 done
 
 enter=(chroot "$device" /bin/env -i PATH=/bin LC_ALL=C ASAN_OPTIONS=detect_leaks=0)
-enter+=(/bin/bash -euo pipefail -c '. /device.sh; . /script; ended')
+enter+=(/bin/bash -euo pipefail -c '. /script; ended')
 if grep -q __asan_init "$program"; then # which reads /proc
     # shellcheck disable=SC2016 # expanded by the inner shell
     bind='mount --rbind /proc "$0" && exec "$@"'
@@ -51,5 +49,5 @@ if grep -q __asan_init "$program"; then # which reads /proc
 fi
 status=0
 $as_root "${enter[@]}" || status=$?
-[[ $as_root != sudo ]] || sudo chown -R "$EUID" "$device"
+[[ $as_root != sudo ]] || sudo chown -Rh "$EUID" "$device"
 exit $status

@@ -1,5 +1,6 @@
 # shellcheck shell=bash disable=SC2154
 # What a start finds, and what it makes of it.
+. /device.sh || exit
 
 # tell NAME...: the warnings of a row of a table, by their names.
 tell() {
@@ -20,7 +21,7 @@ tell() {
     done
 }
 
-# place LINK TEXT: a link with the text of a row, or a file or nothing by the names "file" and "none".
+# place LINK TEXT: a link with the text of a row, a file by the name "file" or nothing by "none".
 place() {
     rm -f "$1"
     case $2 in
@@ -193,7 +194,7 @@ with_full_mask() (umask 0 && "$@")
 without_errors() { "$@" 2>&-; }
 without_reader() (
     mkfifo pipe
-    exec 8<>pipe 9>pipe 8>&-
+    exec 8<>pipe 9>pipe 8>&- # its only reader is gone
     "${with_signals[@]}" "$@" 2>&9
 )
 without_room() (ulimit -f 0 && "${with_signals[@]}" "$@")
