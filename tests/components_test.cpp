@@ -93,8 +93,8 @@ TEST(icu, directory_that_cannot_be_walked_is_an_error) {
 }
 
 TEST(icu, is_compatible_with_icu_data_only) {
-    const mira_icu icu_data("");
-    const mira_zoneinfo zoneinfo_data("");
+    const mira_icu icu_data("nowhere");
+    const mira_zoneinfo zoneinfo_data("nowhere");
     EXPECT_EQ(warnings([&] { EXPECT_FALSE(icu_data.compatible_schema(zoneinfo_data)); }),
         warning("mira_icu::compatible_schema: could not dynamic_cast other component"));
     EXPECT_TRUE(zoneinfo_data.compatible_schema(icu_data));
