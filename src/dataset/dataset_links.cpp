@@ -7,13 +7,7 @@
 
 #include <err.h>
 
-std::string read_latest_link() {
-    return fsutil::read_symlink(paths::latest_link);
-}
-
-std::string read_current_link() {
-    return dataset_path_from_zoneinfo_link(fsutil::read_symlink(paths::zoneinfo_link));
-}
+namespace {
 
 std::string dataset_path_from_zoneinfo_link(const std::string& text) {
     constexpr std::string_view root = paths::dataset_root;
@@ -30,4 +24,14 @@ std::string dataset_path_from_zoneinfo_link(const std::string& text) {
     }
     warn("Bad zoneinfo link %s", text.c_str());
     throw bad_link;
+}
+
+} // namespace
+
+std::string read_latest_link() {
+    return fsutil::read_symlink(paths::latest_link);
+}
+
+std::string read_current_link() {
+    return dataset_path_from_zoneinfo_link(fsutil::read_symlink(paths::zoneinfo_link));
 }
