@@ -21,7 +21,7 @@ start 'a busy start' traced <<<"warning $incompatible"$'\n'"$told"$'\n'"$links"$
 numbered >calls
 names='open|unlink|symlink|readlink|access'
 {
-    sed -nE 's/^\w*('$names')\w* .*\((AT_FDCWD, )?"(\/[^"]*)"(, (O_[A-Z_|]*))?.*/\1 \3 \5/
+    sed -nE 's/^\w*('$names')\w* .*\((AT_FDCWD, )?"(\/[^"]*)"(, ([OF]_[A-Z_|]*))?.*/\1 \3 \5/
         s/ O_.*DIRECTORY.*//; s/\|O_LARGEFILE//; s/ $//
         s/.* 0x40 .*, (0x[0-9a-f]*)\) .*/protect \1/
         s/^write [0-9]+ write\(2, .*/warn/
@@ -46,7 +46,7 @@ open $tz/tz/2016g.1.0/zoneinfo/+VERSION O_RDONLY, open $tz/tz/2016g.1.0/icutz
 unlink $tz/zoneinfo, symlink $tz/tz/2016g.1.0/zoneinfo
 unlink /var/db/icutz, symlink $tz/tz/2016g.1.0/icutz
 open $tz/TZVersionDiffRecord O_WRONLY|O_CREAT|O_TRUNC
-readlink $tz/localtime, warn, access $tz/zoneinfo/No/Zone, warn
+readlink $tz/localtime, warn, access $tz/zoneinfo/No/Zone F_OK, warn
 unlink $tz/localtime, symlink $default_zone
 END
 compare 'the calls of a busy start'
@@ -100,6 +100,7 @@ while read -r current latest; do
         place=$(sed -nE 's|.*"/([^"]*/)?([^"]*)".*|\2|p' <<<"$line")
         if [[ $line == *'"/'* ]]; then
             disturbed error=EIO
+            ! grep -F '(-1' trace || echo "a call on no file after $line"
             [[ $ended -le 1 ]] || echo "exit $ended by $line"
             [[ -d $tz/zoneinfo && $(readlink $tz/zoneinfo) != *2016e* &&
                 $(readlink $tz/localtime) == $zones/* ]] || echo "not usable after $line"

@@ -33,6 +33,7 @@ void check_format(const dataset& data, const std::string& format) {
     const dataset same;
     same.make_file(format.empty() ? "/icutz/none" : "/icutz/icutz" + format + ".dat");
     EXPECT_TRUE(mira_icu(data.path).compatible_schema(mira_icu(same.path))) << format;
+    EXPECT_EQ(mira_icu(data.path).compatible_schema(mira_icu(data.path + "/no")), format.empty());
 }
 
 } // namespace
@@ -53,8 +54,8 @@ TEST(icu, format_is_in_the_name_of_a_regular_file_that_everyone_may_read) {
     const dataset data;
     check_format(data, "");
     for (const std::string name : {"icutz44L.dat", "icutz44x.dat", "icutzl.dat", "icutz44.dat",
-             "icutz44l.dat.bak", "xicutz44l.dat", "icutz44l.DAT", "icutz44lxdat", "icutz:l.dat",
-             "icutz4\xb2l.dat", "icutz/l.dat", "below/icutz44l.dat", "below/below/icutz44l.dat"}) {
+             "icutz44l.dat.bak", "xicutz44l.dat", "icut4l.dat", "icutz44l.DAT", "icutz44lxdat",
+             "icutz4ldat", "icutz:l.dat", "icutz4\xb2l.dat", "icutz/l.dat", "below/icutz44l.dat"}) {
         data.make_file("/icutz/" + name);
     }
     data.make_file("/icutz/icutz45l.dat", "", 0770);

@@ -43,10 +43,8 @@ done
 enter=(chroot "$device" /bin/env -i PATH=/bin LC_ALL=C ASAN_OPTIONS=detect_leaks=0)
 enter+=(/bin/bash -euo pipefail -c '. /script; ended')
 if grep -q __asan_init "$program"; then
-    if ! $as_root unshare --mount true; then
-        echo "AddressSanitizer reads /proc, which takes a mount namespace here" >&2
-        exit 1
-    fi
+    $as_root unshare --mount true ||
+        { echo "AddressSanitizer reads /proc, which takes a mount namespace here" >&2; exit 1; }
     # shellcheck disable=SC2016 # expanded by the inner shell
     bind='mount --rbind /proc "$0" && exec "$@"'
     enter=(unshare --mount sh -c "$bind" "$device/proc" "${enter[@]}")

@@ -12,9 +12,7 @@ tell() {
         bad_link=*) echo "warning Bad zoneinfo link $text" ;;
         bad_path=*) echo "warning mira_dataset::create_components: bad path $text" ;;
         unparsed=*)
-            echo "warning Cannot parse version string $text, results.size() = 0"
-            echo "warning Cannot parse version string $text"
-            ;;
+            printf 'warning Cannot parse version string %s\n' "$text, results.size() = 0" "$text" ;;
         correcting=*) echo "warning Correcting localtime link to $text" ;;
         *) echo "warning ${!name}" ;;
         esac
