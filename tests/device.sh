@@ -2,7 +2,7 @@
 # The words for devices: lay one out, start it, and compare what the start did with a promise.
 [[ -e /device.sh ]] || exit # in a device only, where paths are those of the system
 
-tz=/var/db/timezone zones=/var/db/timezone/zoneinfo
+tz=/var/db/timezone zones=/var/db/timezone/zoneinfo system=/usr/share/zoneinfo.default
 default_zone=$zones/America/Los_Angeles
 incompatible='Symlink points at data incompatible with installed system'
 not_taken='New update not compatible or older version'
@@ -14,14 +14,14 @@ reset_zone='localtime link invalid; resetting to America/Los_Angeles'
 file() { mkdir -p "${1%/*}" && printf %s "${2-}" >"$1"; }
 link() { mkdir -p "${1%/*}" && ln -sfn "$2" "$1"; }
 
-empty_device() { rm -rf var usr/share && mkdir -p usr/share var/db/timezone/tz; }
+empty_device() { rm -rf var usr/share && mkdir -p usr/share var/db; }
 
 # install_system VERSION, install_update VERSION [FORMAT]: the system's ICU format is 44l, and so is
 # an update's where no other is named. Each also holds decoys, which are read in the other only.
 install_system() {
-    file /usr/share/zoneinfo.default/+VERSION "$1"$'\n'
-    file /usr/share/zoneinfo.default/Asia/Tokyo
-    file /usr/share/icu/icutzformat.txt 44l$'\n'
+    file $system/+VERSION "$1"$'\n'
+    file $system/Asia/Tokyo
+    file /usr/share/icu/icutzformat.txt $' 44l more\n'
     file /usr/share/icu/icutz77e.dat
 }
 install_update() {
@@ -33,7 +33,7 @@ install_update() {
 # make_current VERSION: links the data of an update, or of the system by the name "system".
 make_current() {
     rm -rf var/db/icutz
-    link $tz/zoneinfo /usr/share/zoneinfo.default
+    link $tz/zoneinfo $system
     if [[ $1 != system ]]; then
         link $tz/zoneinfo "$tz/tz/$1/zoneinfo"
         link /var/db/icutz "$tz/tz/$1/icutz"
@@ -78,7 +78,7 @@ fact() { # NAME PATH
     if [[ -L $2 ]]; then
         is=$(readlink "$2")
     elif [[ -f $2 ]]; then
-        is=$(cat "$2" && stat -c ', mode %a' "$2")
+        is=$(tr '\0' @ <"$2" && stat -c ', mode %a' "$2")
         [[ -s $2 ]] || is=touched$is
         is=${is%, mode 644}
     elif [[ -e $2 ]]; then

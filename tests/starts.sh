@@ -19,39 +19,41 @@ tell() {
     done
 }
 
-# place LINK TEXT: a link with the text of a row, a file by the name "file" or nothing by "none".
+# place LINK TEXT: a link with the text of a row, or what that names: a file, a directory or none.
 place() {
     rm -f "$1"
     case $2 in
     none) ;;
     file) file "$1" ;;
+    directory) mkdir "$1" ;;
     *) link "$1" "$2" ;;
     esac
 }
 
 # Which dataset is current after a start, by the one that was and by the latest one. A dataset is
-# named by its version; the system's is 2016f, those of 2017 have another ICU format, and 2016i is
-# not there. A name with a slash at its front is the text of the link that would name a dataset.
+# named by its version; the system's is 2016f, later years have other ICU formats, and 2016i is not
+# there. A name that begins with a slash or tz/ is the text of the link that would name a dataset.
 # Current        Latest         Then current  Marker   Record               Warnings
 long=/$(printf 'x%.0s' {1..1023})
 while read -r current latest after marker record warnings; do
     usual_device
     for version in "$current" "$latest"; do
         case $version in
-        system | none | file | /* | 2016i.*) ;;
+        system | none | file | /* | tz/* | 2016i.*) ;;
         2017*) install_update "$version" 48l ;;
+        2018*) install_update "$version" 44b ;;
         *) install_update "$version" ;;
         esac
     done
     case $current in
-    file | /*) place $tz/zoneinfo "$current" ;;
+    file | /* | tz/*) place $tz/zoneinfo "$current" ;;
     *) make_current "$current" ;;
     esac
     [[ -L /var/db/icutz ]] || link /var/db/icutz stale
     [[ $latest != [0-9b]* ]] || latest=$tz/tz/$latest
     place $tz/tz_latest "$latest"
     # What earlier starts left.
-    file $tz/needs_cleanup left
+    mkdir -p $tz/needs_cleanup
     file $tz/TZVersionDiffRecord 'that of an earlier switch'
     mkdir /var/db/icu
     find /usr/share /var -exec touch -hd 2040-01-01 {} + # past the dates of 32-bit systems
@@ -60,7 +62,7 @@ while read -r current latest after marker record warnings; do
         tell $warnings
         case $after in
         "$current") ;;
-        system) printf '%s\n' 'zoneinfo /usr/share/zoneinfo.default' 'icutz none' ;;
+        system) printf '%s\n' "zoneinfo $system" 'icutz none' ;;
         *) printf '%s\n' "zoneinfo $tz/tz/$after/zoneinfo" "icutz $tz/tz/$after/icutz" ;;
         esac
         echo "marker $marker"
@@ -79,12 +81,13 @@ system           beta           system        none     -                    unpa
 system           2016g.1.0/     system        none     -                    unparsed=2016g.1.0/ not_taken
 2016g.1.0        2147483648a    system        none     -                    no_data
 2016g.1.0        none           2016g.1.0     none     -
-2016f.1.0        none           2016f.1.0     none     -
+2016f.1.0        2016g.1.0      2016g.1.0     touched  2016f.1.0_2016g.1.0
 2016g.1.0        2016h.1.0      2016h.1.0     touched  2016g.1.0_2016h.1.0
 2016g.1.0        2016g.1.0      2016g.1.0     none     -                    not_taken
 2016h.1.0        2016g.1.0      2016h.1.0     none     -                    not_taken
 2016e.1.0        none           system        touched  -                    incompatible
 2017a.1.0        none           system        touched  -                    incompatible
+2018a.1.0        none           system        touched  -                    incompatible
 beta             none           system        touched  -                    unparsed=beta incompatible
 2016g.1.0/x      none           system        touched  -                    unparsed=2016g.1.0/x incompatible
 2016e.1.0        2016g.1.0      2016g.1.0     touched  2016f.1.0_2016g.1.0  incompatible
@@ -94,8 +97,12 @@ beta             none           system        touched  -                    unpa
 2147483648a      none           system        none     -                    no_data
 2016g.1.0        ${long}cut     system        none     -                    bad_path=$long no_data
 2016g.1.0        $tz/tz/        system        none     -                    bad_path=$tz/tz/ no_data
+2016g.1.0        $tz/tzx/1a     system        none     -                    bad_path=$tz/tzx/1a no_data
+2016g.1.0        ${system}      system        none     -                    bad_path=$system no_data
+2016g.1.0        tz/2016h.1.0   system        none     -                    bad_path=tz/2016h.1.0 no_data
 2016e.1.0        /x$tz/tz/1a    system        touched  -                    incompatible bad_path=/x$tz/tz/1a no_data
-/usr/share/zoneinfo.default/  none  system      none     -                    bad_link=/usr/share/zoneinfo.default/ bad_links
+$system/         none           system        none     -                    bad_link=$system/ bad_links
+tz/2016g.1.0/x   none           system        none     -                    bad_link=tz/2016g.1.0/x bad_links
 /usr/share/zoneinfo  none       system        none     -                    bad_link=/usr/share/zoneinfo bad_links
 $tz/tz/          none           system        none     -                    bad_link=$tz/tz/ bad_links
 $tz/tz/1a        none           system        none     -                    bad_link=$tz/tz/1a bad_links
@@ -120,21 +127,22 @@ done <<END
 $zones/No/Zone                          -
 $zones                                  -
 ${zones}X                               -
-/usr/share/zoneinfo/Asia/Tokyo          $zones/Asia/Tokyo  correcting=$zones/Asia/Tokyo
+/usr/share/zoneinfo//Asia/Tokyo         $zones//Asia/Tokyo  correcting=$zones//Asia/Tokyo
 /usr/share/zoneinfo                     $zones             correcting=$zones
-/usr/share/zoneinfo/No/Zone             $default_zone      correcting=$zones/No/Zone reset_zone
+/usr/share/zoneinfo/Asia/Tokyo/Zone     $default_zone      correcting=$zones/Asia/Tokyo/Zone reset_zone
 /usr/share/zoneinfo.default/Asia/Tokyo  $default_zone      correcting=$zones.default/Asia/Tokyo reset_zone
 /usr/share/zoneinf                      $default_zone      reset_zone
 /var/db/timezone/zoneinf                $default_zone      reset_zone
 /x$zones/Asia/Tokyo                     $default_zone      reset_zone
 /x/usr/share/zoneinfo/Asia/Tokyo        $default_zone      reset_zone
+../zoneinfo/Asia/Tokyo                  $default_zone      reset_zone
 none                                    $default_zone      reset_zone
-file                                    $default_zone      unreadable=localtime reset_zone
+directory                               $default_zone      unreadable=localtime reset_zone
 END
 
 empty_device
-install_update 2016g.1.0
-rm $tz/tz/2016g.1.0/icutz/icutz44l.dat # the formats are unknown, and so the same
+install_update 2016g.1.0 none # is no format: both are unknown, and so the same
+file /usr/share/icu/icutz77e.dat
 link $tz/tz_latest $tz/tz/2016g.1.0
 start 'the first start of a system without data' <<END
 $(tell unparsed=.1.0)
@@ -174,7 +182,7 @@ rm $tz/zoneinfo
 mkdir $tz/zoneinfo
 kept_zoneinfo="failed remove: could not remove $tz/zoneinfo: Is a directory
 failed Unlink of zoneinfo softlink failed: Is a directory
-failed create_symlink: from $tz/zoneinfo to /usr/share/zoneinfo.default: File exists"
+failed create_symlink: from $tz/zoneinfo to $system: File exists"
 start 'the zoneinfo link cannot be made' <<END
 $(tell unreadable=zoneinfo)
 failed $bad_links: Invalid argument
@@ -185,6 +193,17 @@ exit 1
 END
 install_system 2147483648a
 start 'the version of the system has a number too large' <<<"$(tell no_data)"$'\nexit 1'
+rm -r $tz
+install_system 2016f
+file $tz
+start 'a file stands for the directory of the links' <<END
+failed read_symlink: $tz/tz_latest: Not a directory
+failed $no_data: Not a directory
+failed remove: could not remove $tz/zoneinfo: Not a directory
+failed Unlink of zoneinfo softlink failed: Not a directory
+failed create_symlink: from $tz/zoneinfo to $system: Not a directory
+exit 1
+END
 
 # A busy start, whatever becomes of its surroundings. Signals do what they do by default.
 with_signals=(env "--default-signal=PIPE,XFSZ")
