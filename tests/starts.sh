@@ -1,4 +1,4 @@
-# shellcheck shell=bash disable=SC2154
+# shellcheck shell=bash disable=SC2154,SC2086
 # What a start finds, and what it makes of it.
 . /device.sh || exit
 
@@ -50,15 +50,13 @@ while read -r current latest after marker record warnings; do
     *) make_current "$current" ;;
     esac
     [[ -L /var/db/icutz ]] || link /var/db/icutz stale
-    [[ $latest != [0-9b]* ]] || latest=$tz/tz/$latest
+    [[ $latest != [0-9]* ]] || latest=$tz/tz/$latest
     place $tz/tz_latest "$latest"
-    # What earlier starts left.
-    mkdir -p $tz/needs_cleanup
+    mkdir -p $tz/needs_cleanup # left by an earlier start, as the next two
     file $tz/TZVersionDiffRecord 'that of an earlier switch'
     mkdir /var/db/icu
     find /usr/share /var -exec touch -hd 2040-01-01 {} + # past the dates of 32-bit systems
     {
-        # shellcheck disable=SC2086 # a row has several
         tell $warnings
         case $after in
         "$current") ;;
@@ -76,8 +74,6 @@ system           2016g.1.0      2016g.1.0     none     2016f.1.0_2016g.1.0
 system           2016f.1.1      2016f.1.1     none     2016f.1.0_2016f.1.1
 system           2016f.1.0      system        none     -                    not_taken
 system           2017a.1.0      system        none     -                    not_taken
-system           2016i.1.0      system        none     -                    not_taken
-system           beta           system        none     -                    unparsed=beta not_taken
 system           2016g.1.0/     system        none     -                    unparsed=2016g.1.0/ not_taken
 2016g.1.0        2147483648a    system        none     -                    no_data
 2016g.1.0        none           2016g.1.0     none     -
@@ -88,7 +84,6 @@ system           2016g.1.0/     system        none     -                    unpa
 2016e.1.0        none           system        touched  -                    incompatible
 2017a.1.0        none           system        touched  -                    incompatible
 2018a.1.0        none           system        touched  -                    incompatible
-beta             none           system        touched  -                    unparsed=beta incompatible
 2016g.1.0/x      none           system        touched  -                    unparsed=2016g.1.0/x incompatible
 2016e.1.0        2016g.1.0      2016g.1.0     touched  2016f.1.0_2016g.1.0  incompatible
 2016d.1.0        2016e.1.0      2016e.1.0     touched  2016f.1.0_2016e.1.0  incompatible
@@ -103,7 +98,6 @@ beta             none           system        touched  -                    unpa
 2016e.1.0        /x$tz/tz/1a    system        touched  -                    incompatible bad_path=/x$tz/tz/1a no_data
 $system/         none           system        none     -                    bad_link=$system/ bad_links
 tz/2016g.1.0/x   none           system        none     -                    bad_link=tz/2016g.1.0/x bad_links
-/usr/share/zoneinfo  none       system        none     -                    bad_link=/usr/share/zoneinfo bad_links
 $tz/tz/          none           system        none     -                    bad_link=$tz/tz/ bad_links
 $tz/tz/1a        none           system        none     -                    bad_link=$tz/tz/1a bad_links
 $tz/tz//x        none           system        none     -                    bad_link=$tz/tz//x bad_links
@@ -119,7 +113,6 @@ while read -r before after warnings; do
     usual_device
     file /var/db/icu/entry # cannot be removed, and is no one's concern
     place $tz/localtime "$before"
-    # shellcheck disable=SC2086 # a row has several
     tell $warnings >row
     [[ $after == - ]] || echo "localtime $after" >>row
     start "the local-time link is $before" <row
