@@ -24,14 +24,14 @@ std::string read_current_link_or_reset() {
     }
 }
 
-/// Creates the clean-up marker, an empty file that says that an updated dataset was given up. A
-/// marker that exists is left unchanged. A failure warns "Cannot touch file %s".
+/// Creates the clean-up marker, an empty file, or opens the one that exists. Warns "Cannot touch
+/// file %s" when opening, examining or closing it fails, even if the marker exists then.
 void touch_cleanup_marker() noexcept {
     const int marker = open_dprotected_np(
         paths::cleanup_marker, O_RDWR | O_CREAT, timezone_protection_class, 0, 0666);
     bool touched = false;
     if (marker != -1) {
-        // Only whether the marker can be examined is of interest, not what that shows.
+        // Only whether fstat succeeds counts; the status itself is not used.
         struct stat status;
         touched = ::fstat(marker, &status) == 0;
         touched = ::close(marker) == 0 && touched;
@@ -41,15 +41,15 @@ void touch_cleanup_marker() noexcept {
     }
 }
 
-/// Writes the version record, whole and without a line end: the version text of `active`, the
-/// dataset in use before the switch, an underscore, and that of `latest`. Reports no failure: the
-/// record is news for others, and the switch is done.
+/// Writes the version record: the version text of `active`, an underscore and the version text of
+/// `latest`, without a line end. Replaces an earlier record. Failures are ignored and not reported,
+/// since the links are already switched.
 void write_version_diff_record(const mira_dataset& active, const mira_dataset& latest) noexcept {
     try {
         std::ofstream record(paths::version_record);
         record << active.version_string() << '_' << latest.version_string();
     } catch (...) {
-        // Out of memory for the texts or the stream: ignored like every other failure here.
+        // Out of memory: ignored like a failed open or write.
     }
 }
 
@@ -60,7 +60,7 @@ void select_dataset() {
     const std::string latest_path = read_latest_link();
     const mira_dataset current(read_current_link_or_reset());
 
-    // What was in use before a switch to the latest dataset.
+    // The dataset in use before a switch to the latest one.
     const mira_dataset* active = &current;
     if (!current.compatible_schema(system) || system.newer_than(current)) {
         warn("Symlink points at data incompatible with installed system");
@@ -72,8 +72,7 @@ void select_dataset() {
         return;
     }
     const mira_dataset latest(latest_path);
-    // Compared with the dataset that was current at the start, even when that has just been given
-    // up: an update that is newer than it is taken, though the system's may be newer still.
+    // Compared with `current` and not with `*active`, on purpose; the header says so.
     if (!latest.compatible_schema(system) || !latest.newer_than(current)) {
         warn("New update not compatible or older version");
         return;

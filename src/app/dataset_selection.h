@@ -1,22 +1,26 @@
 #pragma once
 
-/// Decides which dataset the zoneinfo link and the ICU link name from now on: the current one, the
-/// system dataset, or the latest one when the system can read it and it is newer than the one that
-/// was current when the run began.
+/// Selects the dataset that the zoneinfo link and the ICU link name from now on:
+/// - A zoneinfo link that is missing, cannot be read or names no dataset resets both links to the
+///   system dataset, which is then the current one ("Invalid current symlinks; resetting to system
+///   partition").
+/// - A current dataset that has another ICU format than the system, or is older than the system
+///   dataset, also resets them ("Symlink points at data incompatible with installed system").
+/// - A latest dataset that has the system's ICU format and is newer than the current one is linked
+///   and written to the version record; any other is reported ("New update not compatible or older
+///   version"). After a reset for format or age it is still compared with the dataset that was
+///   current before, even if the system dataset is newer than both. A missing latest link is no
+///   failure.
 ///
-/// A zoneinfo link that cannot be read or names no dataset resets both links ("Invalid current
-/// symlinks; resetting to system partition"). A current dataset that the system cannot read, or that
-/// is older than the system's, is given up ("Symlink points at data incompatible with installed
-/// system"). A latest dataset that is not taken is reported ("New update not compatible or older
-/// version"); no latest link is no failure. An update that is given up, so or by a switch, touches
-/// the clean-up marker, or else warns "Cannot touch file %s"; a switch is written to the version
-/// record, as far as that can be written.
+/// An updated dataset that is given up because of its format or age or in a switch touches the
+/// clean-up marker ("Cannot touch file %s" on failure). A failure to write the record is ignored.
 ///
-/// Throws what reading the latest link, building a dataset or switching a link throws; links that
-/// were switched by then stay so.
+/// Throws what reading the latest link, building a dataset or creating a link throws. Links that
+/// were changed before the failure stay changed.
 void select_dataset();
 
 /// Makes the system dataset current: the zoneinfo link names "/usr/share/zoneinfo.default" and the
-/// ICU link is removed. Has no warning of its own and leaves the clean-up marker alone.
-/// Throws what building the system dataset or switching a link throws.
+/// ICU link is removed; one that cannot be removed stays, with the warnings of
+/// `mira_icu::make_current`. Writes no warning of its own and does not touch the clean-up marker.
+/// Throws what building the system dataset or creating the zoneinfo link throws.
 void reset_to_system_partition();

@@ -14,12 +14,14 @@ namespace {
 constexpr char default_zone[] = "America/Los_Angeles";
 
 void replace_localtime_link(const std::string& target) {
-    // Of no interest: what could not be deleted fails the creation, which reports it.
+    // Not fsutil::remove: an empty directory is deleted too, and nothing is reported. An
+    // entry that stays makes create_symlink fail, which reports it.
     std::remove(paths::localtime_link);
     fsutil::create_symlink(target, paths::localtime_link);
 }
 
-/// Throws whenever the link can be neither kept nor corrected.
+/// Throws when the link can be neither kept nor corrected: the `int` -1 without a warning of its
+/// own, or what the link operations throw, after their warning.
 void keep_or_correct_localtime_link() {
     constexpr int invalid_link = -1;
     constexpr std::string_view correctable = paths::correctable_zoneinfo;
@@ -32,7 +34,7 @@ void keep_or_correct_localtime_link() {
         throw invalid_link;
     }
     const std::string corrected = paths::zoneinfo_link + zone_path.substr(correctable.size());
-    // Told before the zone is looked for: a correction that fails is seen to have been tried.
+    // Written before the check, so that a correction that fails is reported too.
     warn("Correcting localtime link to %s", corrected.c_str());
     if (!fsutil::exists(corrected)) {
         throw invalid_link;

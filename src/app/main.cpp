@@ -11,7 +11,8 @@
 int main() try {
     prepare_process();
     prepare_timezone_directories();
-    // Left from before this start; what cannot be deleted stays.
+    // Left over from earlier starts. Not fsutil::remove: an empty directory is deleted too, and a
+    // failure is neither reported nor thrown.
     std::remove(paths::cleanup_marker);
     std::remove(paths::stale_icu);
     try {
@@ -23,6 +24,6 @@ int main() try {
     repair_localtime_link();
     return 0;
 } catch (...) {
-    // Nothing is left to fall back to; the last warning says what was tried.
+    // There is no further fallback.
     return 1;
 }

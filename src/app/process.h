@@ -1,8 +1,8 @@
 #pragma once
 
-/// Prepares the process for a boot, where a run must go on to its end and is watched on a console
-/// that other programs write to at the same time:
-/// - each line of a warning goes out in one write (one of more than PIPE_BUF bytes in several);
-/// - a reader of standard error that is gone, or a file that may not grow, is a failed write and
-///   not the end of the run.
+/// Prepares the process for a boot:
+/// - Each line on standard error is one write, so that it does not mix with the lines of other
+///   programs. A line longer than PIPE_BUF bytes takes several writes.
+/// - SIGPIPE and SIGXFSZ are ignored: a write to a pipe without a reader, or to a file that may not
+///   grow, fails and does not end the run.
 void prepare_process();

@@ -12,7 +12,7 @@ void set_directory_protection_class(const char* path) noexcept {
     if (directory == -1) {
         return;
     }
-    // A class that cannot be set must not keep the device from its time zone: results are ignored.
+    // Results are ignored: the links matter more than the protection class.
     ::fcntl(directory, F_SETPROTECTIONCLASS, timezone_protection_class);
     ::close(directory);
 }

@@ -1,6 +1,6 @@
 #pragma once
 
-/// Puts "/var/db/timezone/" and then "/var/db/timezone/tz/" into the protection class that files
-/// created in them are to have. A directory that is missing or cannot be opened is skipped, a host
-/// that refuses the class is left alone, and neither directory is created. Reports nothing.
+/// Puts "/var/db/timezone/" and then "/var/db/timezone/tz/" into `timezone_protection_class`. A
+/// directory that is missing or cannot be opened is skipped, and a failure to set the class is
+/// ignored. Writes no warning and creates no directory.
 void prepare_timezone_directories() noexcept;

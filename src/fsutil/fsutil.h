@@ -2,10 +2,10 @@
 
 #include <string>
 
-/// The link operations that everything else is built on, each a thin cover of one system call.
+/// Operations on links and paths, each one system call.
 ///
-/// A failure has one shape: a single warning that names the operation and the path, then the
-/// `errno` of the failed call thrown as an `int`. A failed call has changed nothing on disk.
+/// All but `exists` report a failure by one warning, which names the operation and the path, and
+/// then throw the `errno` of the system call as an `int`. A failed call changes nothing on disk.
 namespace fsutil {
 
 /// Removes the file or link at `path` (a link itself, never what it points at; never a directory).
@@ -13,12 +13,12 @@ namespace fsutil {
 /// Any other failure warns "remove: could not remove %s" and throws.
 void remove(const std::string& path);
 
-/// Returns whether something exists at `path`, with links followed: false for a dangling link, and
-/// for whatever cannot be examined. Neither warns nor throws.
+/// Returns whether something exists at `path`, with links followed: false for a dangling link and
+/// for a path that cannot be examined. Neither warns nor throws.
 bool exists(const std::string& path);
 
-/// Returns the text of the link at `path`, unresolved and cut to its first 1,024 bytes; the empty
-/// text when the path is missing.
+/// Returns the text of the link at `path`, unresolved and cut to its first 1,024 bytes; empty when
+/// the path is missing.
 /// Any other failure, such as a path that is no link, warns "read_symlink: %s" and throws.
 std::string read_symlink(const std::string& path);
 
