@@ -3,18 +3,18 @@
 #include <string>
 #include <utility>
 
-/// One kind of time-zone data inside a dataset. A component reads what it needs to know of its data
-/// while it is built and does not change afterwards.
+/// One kind of time-zone data inside a dataset. A component reads its data's version or format when
+/// it is built and does not change afterwards.
 ///
-/// The destructor is not virtual and not public: a component is made with `std::make_shared` of its
+/// The destructor is neither virtual nor public: a component is made with `std::make_shared` of its
 /// own class, whose deleter knows that class, and deleting one through the base does not compile.
 class mira_dataset_component {
 public:
-    /// Returns whether this component's data has a format that readers of `other`'s data can read.
+    /// Returns whether a system that reads `other`'s data can read this component's.
     virtual bool compatible_schema(const mira_dataset_component& other) const = 0;
 
-    /// Puts the system-wide link for this kind of data in order: removes the old one, then creates
-    /// the one that this component's data wants.
+    /// Replaces the system-wide link to this kind of data: removes the old one, then creates one to
+    /// this component's data, unless the system needs no link to it.
     /// Throws what `fsutil::create_symlink` throws, after its warning.
     virtual void make_current() const = 0;
 

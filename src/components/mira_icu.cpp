@@ -21,12 +21,12 @@ struct walk_closer {
 };
 using file_walk = std::unique_ptr<FTS, walk_closer>;
 
-/// Where a `long` is too short for a date, the GNU C library's walk fails to change into a
-/// directory dated after 2038, so it stays where it is.
+/// Where a `long` is too short for a date, the GNU C library's walk cannot change into a directory
+/// dated after 2038. There it does not change directories.
 constexpr int stay_in_place = sizeof(long) < sizeof(std::time_t) ? FTS_NOCHDIR : 0;
 
-/// Opens a walk that follows no link but `root` itself and stays on its file system. Entries come
-/// in the order in which the file system lists them.
+/// Opens a walk that follows no link except `root` itself and does not leave its file system.
+/// Entries come in the order in which the file system lists them.
 file_walk open_walk(std::string root) {
     char* const roots[] = {root.data(), nullptr};
     constexpr int options = FTS_COMFOLLOW | FTS_PHYSICAL | FTS_XDEV | stay_in_place;
@@ -39,8 +39,8 @@ file_walk open_walk(std::string root) {
     return walk;
 }
 
-/// Returns whether the walk's entry is a regular file directly inside the root that users other
-/// than its owner and group may read.
+/// Returns whether the entry is a regular file directly inside the root with read permission for
+/// others.
 bool may_be_data_file(const FTSENT& entry) {
     return entry.fts_errno == 0 && entry.fts_level == 1 && entry.fts_namelen != 0 &&
            entry.fts_info == FTS_F && (entry.fts_statp->st_mode & S_IROTH) != 0;
@@ -67,9 +67,10 @@ void mira_icu::read_system_format() {
     file >> format_;
 }
 
-/// Takes the format from the name of the first data file that the directory lists.
+/// Takes the format from the name of the first data file that the walk finds. Only names in the
+/// directory itself count, but when none does, the walk visits the whole tree below it.
 void mira_icu::find_format() {
-    // Over wide characters, as in mira_version.cpp.
+    // Over wide characters for the reason given in mira_version.cpp.
     const std::wregex data_file_name(LR"(icutz([0-9]+[lbe])\.dat)");
     const file_walk walk = open_walk(icu_path_);
     const FTSENT* entry = nullptr;
