@@ -14,7 +14,7 @@ std::string dataset_path_from_zoneinfo_link(const std::string& text) {
     constexpr int bad_link = -1;
 
     if (text.starts_with(root)) {
-        // A slash right after the root's own would leave a dataset without a name.
+        // With a last slash in or right after the root, the dataset would have no name.
         const std::size_t last_slash = text.rfind('/');
         if (last_slash > root.size()) {
             return text.substr(0, last_slash);

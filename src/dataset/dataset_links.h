@@ -2,8 +2,8 @@
 
 #include <string>
 
-/// Returns the text of the latest link, "/var/db/timezone/tz_latest", unexamined: the directory of
-/// the newest installed dataset. Empty when nothing exists there.
+/// Returns the text of the latest link, "/var/db/timezone/tz_latest", unchecked; it should be the
+/// directory of the newest installed dataset. Empty when nothing exists there.
 /// Throws what `fsutil::read_symlink` throws, after its warning.
 std::string read_latest_link();
 
@@ -11,6 +11,6 @@ std::string read_latest_link();
 /// "/var/db/timezone/zoneinfo" points into: the link's text up to its last slash, when that leaves
 /// a directory below "/var/db/timezone/tz/", or the empty path, for the system dataset, when the
 /// text is "/usr/share/zoneinfo.default".
-/// Any other text, the empty one of a missing link too, warns "Bad zoneinfo link %s" and throws the
-/// `int` -1. Throws what `fsutil::read_symlink` throws, after its warning.
+/// For any other text, or a missing link, warns "Bad zoneinfo link %s" and throws -1 as an `int`.
+/// Throws what `fsutil::read_symlink` throws, after its warning.
 std::string read_current_link();

@@ -8,14 +8,13 @@
 struct mira_version {
     mira_version() = default;
 
-    /// Parses `text`, with the failures of `parse`.
+    /// Parses `text`, with the warnings and exceptions of `parse`.
     explicit mira_version(const std::string& text);
 
-    /// Overwrites all members with what `text` says: digits, lower-case letters, and up to two
-    /// numbers, each after a full stop. Numbers are decimal, leading zeros allowed; a number that
-    /// is not there is -1.
-    /// A text of another form is refused: two warnings, "Cannot parse version string %s,
-    /// results.size() = %d" and "Cannot parse version string %s", and the version is unset.
+    /// Sets all members from `text`: digits, lower-case letters, and up to two numbers, each after
+    /// a full stop. Numbers are decimal, with leading zeros allowed; a missing number gives -1.
+    /// For a text of another form, writes two warnings, "Cannot parse version string %s,
+    /// results.size() = %d" and "Cannot parse version string %s", and leaves the version unset.
     /// Throws `std::out_of_range`, without a warning, for a number above 2147483647; the members
     /// before it then have their new values.
     void parse(const std::string& text);
