@@ -5,8 +5,9 @@
 #include <string>
 
 /// ICU time-zone data: "/usr/share/icu" in the system dataset, the subdirectory "icutz" of an
-/// updated dataset. Its format is the first word of the system's "icutzformat.txt", unchecked, or
-/// is taken from the name of an update's data file: 44l from "icutz44l.dat".
+/// updated dataset. Its format is the first word of the system's "icutzformat.txt", unchecked; in
+/// an update it is part of a data file's name, a number and one of the letters l, b and e: 44l in
+/// "icutz44l.dat".
 class mira_icu final : public mira_dataset_component {
 public:
     /// Builds the component of the dataset in the directory `dataset_path`; the empty path is the
