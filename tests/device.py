@@ -9,29 +9,20 @@ import ctypes
 import difflib
 import fcntl
 import os
-import pathlib
 import re
-import select
 import shutil
 import signal
 import stat
 import subprocess
 import sys
 
-TZ = '/var/db/timezone'
-DATASETS = f'{TZ}/tz'
-LATEST = f'{TZ}/tz_latest'
-ZONEINFO = f'{TZ}/zoneinfo'
-ICU = '/var/db/icutz'
-LOCALTIME = f'{TZ}/localtime'
-DEFAULT_ZONE = f'{ZONEINFO}/America/Los_Angeles'
-MARKER = f'{TZ}/needs_cleanup'
-RECORD = f'{TZ}/TZVersionDiffRecord'
-SYSTEM = '/usr/share/zoneinfo.default'
-SYSTEM_ICU = '/usr/share/icu'
-LONG = '/' + 1023 * 'x'  # all that is read of a link that is longer
+TZ, SYSTEM, SYSTEM_ICU = '/var/db/timezone', '/usr/share/zoneinfo.default', '/usr/share/icu'
+DATASETS, LATEST, ZONEINFO, ICU = f'{TZ}/tz', f'{TZ}/tz_latest', f'{TZ}/zoneinfo', '/var/db/icutz'
+LOCALTIME, DEFAULT_ZONE = f'{TZ}/localtime', f'{ZONEINFO}/America/Los_Angeles'
+MARKER, RECORD = f'{TZ}/needs_cleanup', f'{TZ}/TZVersionDiffRecord'
+LONG = '/' + 1023 * 'x'  # as much as is read of a link
 
-# The words for warnings. `bad_link=TEXT` has TEXT in place of the braces.
+# The words for warnings. What follows a word and `=` takes the place of the braces.
 WARNINGS = {
     'bad_link': 'Bad zoneinfo link {}',
     'bad_links': 'Invalid current symlinks; resetting to system partition',
@@ -44,17 +35,16 @@ WARNINGS = {
     'unparsed': 'Cannot parse version string {0}, results.size() = 0\nCannot parse version string {0}',
     'unreadable': 'read_symlink: {}: Invalid argument',
 }
-
-# No start may heed these; only a sanitizer does.
+# Every start has these and must not heed them.
 ARGUMENTS = ['--version', '-x', '/elsewhere']
-ENVIRONMENT = dict.fromkeys(
-    'DEBUG DESTDIR HOME ICU_DATA ICU_TIMEZONE_FILES_DIR LANG LC_ALL PATH PREFIX PWD ROOT TMPDIR TZ '
-    'TZDIR TZPATH USER VERBOSE ZONEINFO'.split(), '/elsewhere') | {'ASAN_OPTIONS': 'detect_leaks=0'}
+VARIABLES = 'DEBUG DESTDIR HOME ICU_DATA ICU_TIMEZONE_FILES_DIR LANG LC_ALL PATH PWD ROOT TMPDIR TZ TZDIR'
+ENVIRONMENT = {**dict.fromkeys(VARIABLES.split(), '/elsewhere'), 'ASAN_OPTIONS': 'detect_leaks=0'}
 
+WORDS = {'system': f'link {SYSTEM}', 'file': 'file', 'directory': 'directory', 'none': None}
 KINDS = {'-rw-r--r--': 'file', 'drwxr-xr-x': 'directory', 'lrwxrwxrwx': 'link'}
 OLD = 2208988800, 2**31 - 1  # 2040, and what that is on a file system whose dates end before
 command = ['/mira_tzlinks']
-harness = None  # in a device, the snapshot of what it holds for our sake
+harness = None  # in a device, a snapshot of what it holds for our sake
 
 
 def put(path, what=None):
@@ -71,12 +61,13 @@ def put(path, what=None):
     elif kind == 'directory':
         os.mkdir(path)
     elif kind == 'file':
-        pathlib.Path(path).write_bytes(os.fsencode(content))
+        with open(path, 'wb') as file:
+            file.write(os.fsencode(content))
 
 
 def snapshot():
-    """Returns, by path, all that is on the device: `link TEXT`, `file CONTENT` or `directory`, or its
-    mode in place of that word where it is another than usual; ` *` follows unless the time is OLD."""
+    """Returns, by path, what is on the device: `link TEXT`, `file CONTENT` or `directory`, with the
+    mode for the word where it is not the usual one, and ` *` behind it unless its time is OLD."""
     seen = {}
     for parent, directories, files in os.walk('/'):
         directories[:] = [name for name in directories if name != 'proc']
@@ -86,13 +77,14 @@ def snapshot():
             if mode[0] == 'l':
                 content = f' {os.readlink(path)}'
             elif mode[0] == '-' and status.st_size:
-                content = f' {os.fsdecode(pathlib.Path(path).read_bytes())}'
+                with open(path, 'rb') as file:
+                    content = f' {os.fsdecode(file.read())}'
             seen[path] = KINDS.get(mode, mode) + content + ' *' * (int(status.st_mtime) not in OLD)
     return seen
 
 
 def install_system(version, icu_format='44l'):
-    """Installs the system dataset, with a file that would be data in an updated one."""
+    """Installs the system dataset, with a file that would be data in an update."""
     put(f'{SYSTEM}/+VERSION', f'file {version}\n')
     put(f'{SYSTEM}/Asia/Tokyo', 'file')
     put(f'{SYSTEM_ICU}/icutzformat.txt', f'file {icu_format}\n')
@@ -100,7 +92,7 @@ def install_system(version, icu_format='44l'):
 
 
 def install_update(version):
-    """Installs an updated dataset, with files that would count in that of the system."""
+    """Installs an update, with texts that would count in the system dataset; some have other formats."""
     icu_format = {'2017': '48l', '2018': '44b'}.get(version[:4], '44l')
     put(f'{DATASETS}/{version}/zoneinfo/+VERSION', 'file 1999z\n')
     put(f'{DATASETS}/{version}/icutz/icutz{icu_format}.dat', 'file')
@@ -108,27 +100,32 @@ def install_update(version):
 
 
 def data_links(version):
-    """Returns, by path, the data links to an updated dataset or to that of the "system"."""
+    """Returns, by path, the data links while a version, or "system", is current."""
     if version == 'system':
         return {ZONEINFO: f'link {SYSTEM}', ICU: None}
     return {path: f'link {DATASETS}/{version}/{os.path.basename(path)}' for path in (ZONEINFO, ICU)}
 
 
 def switched(current, latest):
-    """Returns, by path, what a start changes that switches to the latest dataset."""
+    """Returns, by path, what a switch from one version to another changes."""
     return data_links(latest) | {RECORD: f'file {current}_{latest}'}
 
 
-def lay_out(current='system', latest=None, localtime=f'{ZONEINFO}/Asia/Tokyo', system='2016f'):
-    """Makes the device anew: the system dataset of a version, two updates, and the links."""
-    for path in '/usr/share', '/var':
-        put(path)
+def lay_out(current='system', latest='none', localtime=f'{ZONEINFO}/Asia/Tokyo', system='2016f'):
+    """Makes the device anew. The zoneinfo, the latest and the local-time link have a text that begins
+    with a slash or a dot, are one of WORDS, or lead to an update of a version."""
+    put('/usr/share')
+    put('/var')
     put(DATASETS, 'directory')
     install_system(system)
-    for version in {current, latest} - {'system', None}:
+    links = {ZONEINFO: current, LATEST: latest, LOCALTIME: localtime, ICU: './stale'}
+    links = {path: WORDS.get(text, f'link {text}') for path, text in links.items()}
+    versions = [text for text in (current, latest) if text not in WORDS and text[0] not in './']
+    for version in versions:
         install_update(version)
-    links = {LATEST: latest and f'link {DATASETS}/{latest}', LOCALTIME: f'link {localtime}'}
-    for path, what in (data_links(current) | links).items():
+    if latest in versions:
+        links[LATEST] = f'link {DATASETS}/{latest}'
+    for path, what in (links | (data_links(current) if current in versions else {})).items():
         put(path, what)
 
 
@@ -141,8 +138,8 @@ def lay_out_busy():
 
 
 def run(*before, prepare=None):
-    """Runs the program, behind another command if there is one and after a call of `prepare` in its
-    process; returns it with what it has printed and its status."""
+    """Runs the program to its end, behind the words of another command and after a call of `prepare`
+    in its process; returns it with its output and status."""
     process = subprocess.run([*before, *command, *ARGUMENTS], env=ENVIRONMENT, preexec_fn=prepare,
                              stdin=subprocess.DEVNULL, capture_output=True, timeout=20)
     if b'PTRACE' in process.stderr:
@@ -151,12 +148,8 @@ def run(*before, prepare=None):
 
 
 def start(warnings=(), changes={}, status=0, before=(), prepare=None):
-    """Runs the program and checks its warnings, what it changes on the device, and its exit status.
-
-    A warning is a word or a text, with `: ERROR` where a call has just failed and without the error
-    that follows elsewhere. Everything on the device has to stay, its time included, but for
-    `changes`, by path. A difference is printed and ends this process.
-    """
+    """Runs the program and checks its warnings, its exit status, and all that it changes, by path. A
+    warning has `: ERROR` where a call has just failed, and elsewhere is taken with any error."""
     for path in snapshot():
         os.utime(path, (OLD[0], OLD[0]), follow_symlinks=False)
     expected = snapshot()
@@ -186,46 +179,35 @@ def compare(expected, seen):
     """Ends this process and shows both lists of lines, unless they are the same."""
     if expected != seen:
         signs = {'-': '  expected ', '+': '  seen     ', ' ': '           '}
-        lines = list(difflib.unified_diff(expected, seen, n=99, lineterm=''))[3:]
+        lines = [*difflib.unified_diff(expected, seen, n=99, lineterm='')][3:]
         sys.exit('\n'.join(signs[line[0]] + line[1:300] for line in lines))
 
 
-def rows(table):
-    """Makes each row of the table a test: a call of the function with the row's cells. The first row
-    names the columns, and braces hold a name of this file."""
-    line = sys._getframe(1).f_lineno
-
-    def add(function):
-        function.rows = [*enumerate(table.splitlines(), line)][2:]
-        return function
-
-    return add
-
-
 def main(*tools):
-    """Runs the functions of a script named test_... and their rows, in a device beside PROGRAM: those
-    with every WORD in their titles. `EMULATOR;PROGRAM` runs that of another processor."""
+    """Runs the tests of a script in a device beside PROGRAM: functions named test_..., or calls of one
+    with the cells of each row of the table in its text; those that have every WORD in their titles."""
     if len(sys.argv) == 1:
-        sys.exit(f'usage: {sys.argv[0]} PROGRAM [WORD...]')
+        sys.exit(f'usage: {sys.argv[0]} [EMULATOR;]PROGRAM [WORD...]')
     *emulator, program = sys.argv[1].split(';')
     command[:0] = [f'/{os.path.basename(path)}' for path in emulator]
-
+    tests = []
+    for name, function in vars(__main__).items():
+        if name.startswith('test_'):
+            text, _, table = (function.__doc__ or '').partition('\n\n')
+            first = function.__code__.co_firstlineno + text.count('\n') + 3
+            rows = [*enumerate(table.splitlines(), first)][1:-1] or [(first - 3, '')]
+            tests += [(line, f'{name} {row}', function, row) for line, row in rows]
+    tests = [test for test in tests if all(word in test[1] for word in sys.argv[2:])]
 
     def run_tests():
-        passed = 0
-        for name, function in [*vars(__main__).items()]:
-            if not name.startswith('test_'):
-                continue
-            for line, row in getattr(function, 'rows', [(function.__code__.co_firstlineno, '')]):
-                if all(word in f'{name} {row}' for word in sys.argv[2:]):
-                    try:
-                        function(*row.format(**globals()).split())
-                    except BaseException:
-                        print(f'{sys.argv[0]}:{line}: {name} {row}', file=sys.stderr)
-                        raise
-                    passed += 1
-        print(f'{passed} passed')
-        return passed > 0
+        for line, title, function, row in tests:
+            try:
+                function(*row.partition('#')[0].format(**globals()).split())
+            except BaseException:
+                print(f'{sys.argv[0]}:{line}: {title}', file=sys.stderr)
+                raise
+        print(f'{len(tests)} passed')
+        return tests
 
     script = os.path.basename(sys.argv[0]).removesuffix('.py')
     in_device(run_tests, program, f'{os.path.dirname(program)}/device.{script}', [*emulator, *tools])
@@ -233,38 +215,33 @@ def main(*tools):
 
 def in_device(action, program, place, tools=(), keep=False):
     """Makes the directory `place` a device with the program and the tools, calls `action` in it, and
-    ends this process, with 0 when that has returned true. The device is removed unless the action
-    has failed or `keep` is true. Another user becomes root first, in a user namespace or by sudo."""
+    ends this process, with 0 when that returned true. Removes the device unless the action failed or
+    `keep` is true. Another user becomes root for that, in a user namespace or by sudo."""
     become_root()
+    signals = signal.SIGINT, signal.SIGTERM, signal.SIGHUP, signal.SIGCHLD
+    signal.pthread_sigmask(signal.SIG_BLOCK, signals[:3])
+    ctypes.CDLL(None).prctl(1, signal.SIGTERM)  # once our own parent has ended
     os.umask(0o022)
     os.makedirs(place, exist_ok=True)
     lock = os.open(place, os.O_DIRECTORY | os.O_NOFOLLOW)
-    fcntl.flock(lock, fcntl.LOCK_EX)  # waits for another run
+    fcntl.flock(lock, fcntl.LOCK_EX)  # after another run
     empty(place)
+    signal.pthread_sigmask(signal.SIG_BLOCK, signals)
     child = os.fork()
     if child == 0:
+        signal.pthread_sigmask(signal.SIG_UNBLOCK, signals)
         enter(place, program, tools)
         sys.exit(not action())
     os.setpgid(child, child)
-    signals = signal.SIGINT, signal.SIGTERM, signal.SIGHUP
-    try:
-        for number in signals:
-            signal.signal(number, lambda *_: sys.exit(128))
-        ended = select.poll()
-        ended.register(os.pidfd_open(child), select.POLLIN)
-        ended.register(1, 0)  # that of the reader of what is printed
-        ended.poll()
-    finally:
-        for number in signals:
-            signal.signal(number, signal.SIG_IGN)
-        os.killpg(child, signal.SIGKILL)
-        status = os.waitstatus_to_exitcode(os.waitpid(child, 0)[1])
-        if status == (0 if keep else 1):
-            subprocess.run(['chown', '-Rh', os.environ.get('SUDO_UID', '0'), place], check=True)
-            print(f'The device is kept: {place}')
-        else:
-            empty(place)
-            os.rmdir(place)
+    signal.sigwait(signals)  # the child has ended, or is to end now
+    os.killpg(child, signal.SIGKILL)
+    status = os.waitstatus_to_exitcode(os.waitpid(child, 0)[1])
+    if status == (0 if keep else 1):
+        subprocess.run(['chown', '-Rh', os.environ.get('SUDO_UID', '0'), place], check=True)
+        print(f'The device is kept: {place}', file=sys.stderr)
+    else:
+        empty(place)
+        os.rmdir(place)
     sys.exit(status)
 
 
@@ -279,35 +256,41 @@ def become_root():
 
 def empty(place):
     """Removes what is in the directory, unless something is mounted there."""
-    mounts = pathlib.Path('/proc/self/mountinfo').read_text()
-    points = re.sub(r'\\(\d+)', lambda code: chr(int(code[1], 8)), mounts)
+    with open('/proc/self/mountinfo') as mounts:
+        points = re.sub(r'\\(\d+)', lambda code: chr(int(code[1], 8)), mounts.read())
     if f' {os.path.realpath(place)}/' in points:
         sys.exit(f'{place} is not emptied: something is mounted in it')
-    subprocess.run(['rm', '-rf', '--one-file-system', *pathlib.Path(place).glob('*')], check=True)
+    entries = [entry.path for entry in os.scandir(place)]
+    subprocess.run(['rm', '-rf', '--one-file-system', '--', *entries], check=True)
 
 
 def enter(place, program, tools):
     """Furnishes the device with the program, the tools and what they need, and makes it the root."""
     global harness
-    copies = {os.path.abspath(path): path for path in (sys.argv[0], __file__)}  # for a traceback
+    copies = {path: path for path in map(os.path.abspath, (sys.argv[0], __file__))}  # for a traceback
     for name, path in {'mira_tzlinks': program, **{tool: shutil.which(tool) for tool in tools}}.items():
         if not path or not os.path.isfile(path):
             sys.exit(f'there is no {path or name}')
         ldd = subprocess.run(['ldd', path], capture_output=True, text=True).stdout
-        copies |= {path: path for path in re.findall(r'^\t(?:\S+ => )?(/\S+) \(0x', ldd, re.MULTILINE)}
+        copies |= {path: path for path in re.findall(r'\t(?:\S+ => )?(/\S+) \(0x', ldd)}
         copies[f'/{os.path.basename(name)}'] = path
-    for name, path in copies.items():
+    for name, path in (copies | {'/dev/null': '/dev/null', '/trace': '/dev/null'}).items():
         os.makedirs(os.path.dirname(place + name), exist_ok=True)
-        shutil.copy(path, place + name)
-    for name in '/dev/null', '/trace', '/proc/none':
-        os.makedirs(os.path.dirname(place + name), exist_ok=True)
-        open(place + name, 'w').close()
-    if b'__asan_init' in pathlib.Path(program).read_bytes():  # AddressSanitizer reads /proc
-        if ctypes.CDLL(None).unshare(0x20000):
-            sys.exit('AddressSanitizer reads /proc, which takes a mount namespace here')
-        for words in ['--make-rprivate', '/'], ['--rbind', '/proc', f'{place}/proc']:
-            subprocess.run(['mount', *words], check=True)
+        shutil.copyfile(path, place + name)
+        shutil.copymode(path, place + name)
+    with open(program, 'rb') as file:
+        if b'__asan_init' in file.read():  # AddressSanitizer reads /proc
+            show_proc(place)
     os.chroot(place)
     os.chdir('/')
     harness = {}
     harness = snapshot()
+
+
+def show_proc(place):
+    """Mounts /proc in the device, in a mount namespace of this process."""
+    if ctypes.CDLL(None).unshare(0x20000) != 0:
+        sys.exit('AddressSanitizer reads /proc, which takes a mount namespace')
+    os.mkdir(f'{place}/proc')
+    for words in ['--make-rprivate', '/'], ['--rbind', '/proc', f'{place}/proc']:
+        subprocess.run(['mount', *words], check=True)
