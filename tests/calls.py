@@ -1,10 +1,9 @@
 #!/usr/bin/env -S python3 -EsB
-"""What a start asks of the system, and what is left when a call fails or the power is cut."""
+"""What a start asks of the system, and what it leaves when a call fails or the power is cut."""
 
 import collections
 import os
 import re
-import signal
 
 from device import (DATASETS, DEFAULT_ZONE, ICU, LATEST, LOCALTIME, MARKER, RECORD, SYSTEM, TZ,
                     ZONEINFO, compare, lay_out, lay_out_busy, main, run, snapshot, start)
@@ -12,119 +11,97 @@ from device import (DATASETS, DEFAULT_ZONE, ICU, LATEST, LOCALTIME, MARKER, RECO
 STRACE = ['/strace', '-qq', '-o', '/trace']
 ON_PATH = re.compile(r'\w*?(open|unlink|symlink|readlink|access|stat|rename|rmdir|mkdir|chmod)\w*'
                      r'\((?:AT_FDCWD, )?"(/[^"]*)"(?:, ([OF]_[A-Z_|]+))?')
+FILES = {ZONEINFO: 'zoneinfo', ICU: 'icu', LOCALTIME: 'local', MARKER: 'marker', RECORD: 'record'}
+READ_SYSTEM = f'open {SYSTEM}/+VERSION O_RDONLY, open /usr/share/icu/icutzformat.txt O_RDONLY,'
+BEGIN = f'''open {TZ}/ O_RDONLY|O_CLOEXEC, protect 0x4, open {TZ}/tz/ O_RDONLY|O_CLOEXEC, protect 0x4,
+    unlink {MARKER}, unlink /var/db/icu, {READ_SYSTEM} readlink {LATEST}, readlink {ZONEINFO},'''
 
 
 def trace():
-    """Returns the calls of a traced start, from the first on the device: the name of each, its number
-    among those of that name, and its line."""
+    """Returns the calls of a start, from the first on the device on: the name of each, its number
+    among those of the name, and its line."""
     calls, numbers = [], collections.Counter()
     with open('/trace') as lines:
         for line in lines:
-            name = line.partition('(')[0]
-            numbers[name] += 1
-            if calls or '"/var/db/timezone/"' in line:
+            numbers[name := line.partition('(')[0]] += 1
+            if calls or f'"{TZ}/"' in line:
                 calls.append((name, numbers[name], line))
     return calls
 
 
 def compare_calls(expected):
-    """Compares calls on paths with their flags, protection classes, and the files open at warnings."""
+    """Compares calls on paths with their flags, protection classes, and warnings with open files."""
     seen, files = [], 0
     for _, _, line in trace():
+        files += 2 * line.startswith('pipe')  # of a sanitizer
         files += bool(re.match(r'open.* = \d', line)) - bool(re.match(r'close.* = 0', line))
-        if on_path := ON_PATH.match(line):
+        on_path = ON_PATH.match(line)
+        if on_path and not ('stat' in on_path[1] and '/icutz/' in on_path[2]):  # as some walks do
             flags = (on_path[3] or '').replace('|O_LARGEFILE', '').partition('|O_NONBLOCK')[0]
             seen.append(f'{on_path[1]} {on_path[2]} {flags}'.strip())
         elif line.startswith('fcntl'):
             seen.append('protect ' + re.search(r' 0x40 .*(0x\d+)\)', line)[1])
         elif line.startswith('write(2, '):
-            seen.append(f'warn with {files} files open')
-    compare(re.split(r',\s+', expected), [*seen, f'end with {files} files open'])
-
-
-# What each start does first, and what the system dataset is read by.
-SYSTEM_READ = f'open {SYSTEM}/+VERSION O_RDONLY, open /usr/share/icu/icutzformat.txt O_RDONLY, '
-FIRST = f'''open {TZ}/ O_RDONLY|O_CLOEXEC, protect 0x4, open {TZ}/tz/ O_RDONLY|O_CLOEXEC, protect 0x4,
-    unlink {MARKER}, unlink /var/db/icu, {SYSTEM_READ} readlink {LATEST}, readlink {ZONEINFO}, '''
+            seen.append('warn' + f' with {files} files open' * bool(files))
+    compare(re.split(r',\s+', expected), seen + [f'{files} files left open'] * bool(files))
 
 
 def test_calls_of_a_start_with_nothing_to_do():
     lay_out()
     start(before=STRACE)
-    compare_calls(f'{FIRST} {SYSTEM_READ} readlink {LOCALTIME}, end with 0 files open')
+    compare_calls(f'{BEGIN} {READ_SYSTEM} readlink {LOCALTIME}')
 
 
 def test_calls_of_a_busy_start():
     start(*lay_out_busy(), before=STRACE)
     old, new = f'{DATASETS}/2016e.1.0', f'{DATASETS}/2016g.1.0'
-    compare_calls(f'''{FIRST} open {old}/zoneinfo/+VERSION O_RDONLY, stat {old}/icutz,
-        open {old}/icutz O_RDONLY, warn with 0 files open,
-        {SYSTEM_READ} unlink {ZONEINFO}, symlink {SYSTEM}, unlink {ICU}, open {MARKER} O_RDWR|O_CREAT,
-        open {new}/zoneinfo/+VERSION O_RDONLY, stat {new}/icutz, open {new}/icutz O_RDONLY,
-        unlink {ZONEINFO}, symlink {new}/zoneinfo, unlink {ICU}, symlink {new}/icutz,
-        open {RECORD} O_WRONLY|O_CREAT|O_TRUNC, readlink {LOCALTIME}, warn with 0 files open,
-        access {ZONEINFO}/No/Zone F_OK, warn with 0 files open, unlink {LOCALTIME},
-        symlink {DEFAULT_ZONE}, end with 0 files open''')
+    compare_calls(f'''{BEGIN} open {old}/zoneinfo/+VERSION O_RDONLY, stat {old}/icutz,
+        open {old}/icutz O_RDONLY, warn, {READ_SYSTEM} unlink {ZONEINFO}, symlink {SYSTEM}, unlink {ICU},
+        open {MARKER} O_RDWR|O_CREAT, open {new}/zoneinfo/+VERSION O_RDONLY, stat {new}/icutz,
+        open {new}/icutz O_RDONLY, unlink {ZONEINFO}, symlink {new}/zoneinfo, unlink {ICU},
+        symlink {new}/icutz, open {RECORD} O_WRONLY|O_CREAT|O_TRUNC, readlink {LOCALTIME}, warn,
+        access {ZONEINFO}/No/Zone F_OK, warn, unlink {LOCALTIME}, symlink {DEFAULT_ZONE[5:]}''')
 
 
-def test_marker_cannot_be_examined_or_closed():
-    lay_out_busy()
-    run(*STRACE)
-    calls = trace()
-    opened = [f'{MARKER}", O_' in line for _, _, line in calls].index(True)
-    for name, number, _ in calls[opened + 1:opened + 3]:
-        warnings, changes = lay_out_busy()
-        warnings[1:1] = [f'Cannot touch file {MARKER}: Input/output error']
-        start(warnings, changes, before=[*STRACE, f'-einject={name}:error=EIO:when={number}'])
+def test_disturbed(current, latest, *losses):
+    """Every call on a file fails once: the start goes on to its end and leaves links that can be used.
+    And the power is cut before every call that changes a file: after one more start, some files are
+    not what they are without the cut. The manual page has these losses, and no others, in CAVEATS.
 
-
-def test_correction_cannot_be_linked():
-    lay_out(localtime='/usr/share/zoneinfo/Asia/Tokyo')
-    error = 'Input/output error'
-    start([f'correcting={ZONEINFO}/Asia/Tokyo',
-           f'create_symlink: from {LOCALTIME} to {ZONEINFO}/Asia/Tokyo: {error}', f'reset_zone: {error}'],
-          {LOCALTIME: f'link {DEFAULT_ZONE}'}, before=[*STRACE, '-einject=/^symlink:error=EIO:when=1'])
-
-
-def test_disturbed_start(current, latest, *lost):
-    """Every call on a path fails once: the start ends by itself, with links that can be used. And the
-    power is cut before each call that changes something: two more starts leave some files unlike
-    those of starts without a cut. The manual page names these losses, and no others, in CAVEATS.
-
-    current    latest     files, each behind that of the call which was not made
-    system     2016g.1.0  icutz:icutz icutz:record record:record localtime:localtime
-    2016f.1.1  2016g.1.0  zoneinfo:record icutz:icutz icutz:record marker:record record:record localtime:localtime
-    2016e.1.0  2016g.1.0  icutz:icutz icutz:record record:record localtime:localtime
-    2016e.1.0  none       icutz:icutz localtime:localtime
-    system     none       localtime:localtime
+    current    latest     losses, each behind the file that the call was for
+    system     2016g.1.0  icu:icu icu:record record:record local:local
+    2016f.1.1  2016g.1.0  zoneinfo:record icu:icu icu:record marker:record record:record local:local
+    2016e.1.0  2016g.1.0  icu:icu icu:record record:record local:local
+    2016e.1.0  none       icu:icu local:local
+    system     none       local:local
     """
-    names = {ZONEINFO: 'zoneinfo', ICU: 'icutz', LOCALTIME: 'localtime', MARKER: 'marker', RECORD: 'record'}
-
-    def start_disturbed(*injection):
+    def start_but(injection):
         lay_out(current, latest, '/usr/share/zoneinfo')
-        return run(*STRACE, *injection)
+        return run(*STRACE, f'-einject={injection}')
 
     def files():
         seen = snapshot()
-        return {(name, seen.get(path, '').removesuffix(' *')) for path, name in names.items()}
+        return {(name, seen.get(path, '').removesuffix(' *')) for path, name in FILES.items()}
 
-    start_disturbed()
-    calls, undisturbed, differing = trace(), files(), set()
+    start_but('rename:error=EIO')  # which no start calls
+    calls, undisturbed, lost = trace(), files(), set()
     run()
     undisturbed |= files()
     for name, number, line in calls:
         path = (re.findall(r'"(/[^"]*)"', line) or [path])[-1]
-        if '"/' in line:
-            process = start_disturbed(f'-einject={name}:error=EIO:when={number}')
-            usable = os.path.isdir(ZONEINFO) and os.readlink(LOCALTIME).startswith(ZONEINFO)
-            no_file = '(-1,' in ''.join(line for _, _, line in trace())
-            no_data = b'locate' in process.stderr and 'icutz"' in line and 'link' not in name
-            compare([line, '0 True False False'], [line, f'{process.returncode} {usable} {no_file} {no_data}'])
+        if '"/' in line or path == MARKER and re.search('stat|close', name):
+            process = start_but(f'{name}:error=EIO:when={number}')
+            faults = {'ends too early': process.returncode, 'no data': not os.path.isdir(ZONEINFO),
+                      'no local time': not os.readlink(LOCALTIME).startswith(ZONEINFO),
+                      'a call on no file': any('(-1,' in line for _, _, line in trace()),
+                      'no format is no failure': path.endswith('.0/icutz') and b'locate' in process.stderr,
+                      'marker': (b'touch' in process.stderr) != (path == MARKER and 'link' not in name)}
+            compare([], [f'{fault}: {line}' for fault, found in faults.items() if found])
         if re.search('unlink|symlink|O_CREAT|write.*"20', line):
-            compare([-9], [start_disturbed(f'-einject={name}:signal=KILL:when={number}').returncode])
+            compare([-9], [start_but(f'{name}:signal=KILL:when={number}').returncode])
             run()
-            differing |= {f'{names[path]}:{name}' for name, _ in files() - undisturbed}
-    compare(sorted(lost), sorted(differing))
+            lost |= {f'{FILES[path]}:{name}' for name, _ in files() - undisturbed}
+    compare(sorted(losses), sorted(lost))
 
 
 main('strace')

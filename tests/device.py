@@ -1,10 +1,9 @@
-"""A device, and the words to lay one out, start it, and compare what happened with what should have.
+"""A device, and the words to lay one out, start it, and compare what happened with what should.
 
-A device is a directory with the program in it. A process of ours enters it by chroot: the system's
-paths are paths in there, and nothing that a test does can reach what lies outside.
+A device is a directory with the program in it, which a process of ours enters by chroot: paths are
+the system's own in there, and nothing that a test does can reach what lies outside.
 """
 
-import __main__
 import ctypes
 import difflib
 import fcntl
@@ -18,56 +17,52 @@ import sys
 
 TZ, SYSTEM, SYSTEM_ICU = '/var/db/timezone', '/usr/share/zoneinfo.default', '/usr/share/icu'
 DATASETS, LATEST, ZONEINFO, ICU = f'{TZ}/tz', f'{TZ}/tz_latest', f'{TZ}/zoneinfo', '/var/db/icutz'
-LOCALTIME, DEFAULT_ZONE = f'{TZ}/localtime', f'{ZONEINFO}/America/Los_Angeles'
+LOCALTIME, DEFAULT_ZONE = f'{TZ}/localtime', f'link {ZONEINFO}/America/Los_Angeles'
 MARKER, RECORD = f'{TZ}/needs_cleanup', f'{TZ}/TZVersionDiffRecord'
 LONG = '/' + 1023 * 'x'  # as much as is read of a link
 
 # The words for warnings. What follows a word and `=` takes the place of the braces.
 WARNINGS = {
-    'bad_link': 'Bad zoneinfo link {}',
+    'bad_link': 'Bad zoneinfo link {}', 'correcting': 'Correcting localtime link to {}',
     'bad_links': 'Invalid current symlinks; resetting to system partition',
     'bad_path': 'mira_dataset::create_components: bad path {}',
-    'correcting': 'Correcting localtime link to {}',
     'incompatible': 'Symlink points at data incompatible with installed system',
     'no_data': 'Unable to locate data; resetting to system partition',
+    'no_link': 'read_symlink: {}: Invalid argument',
     'not_taken': 'New update not compatible or older version',
     'reset_zone': 'localtime link invalid; resetting to America/Los_Angeles',
-    'unparsed': 'Cannot parse version string {0}, results.size() = 0\nCannot parse version string {0}',
-    'unreadable': 'read_symlink: {}: Invalid argument',
-}
-# Every start has these and must not heed them.
-ARGUMENTS = ['--version', '-x', '/elsewhere']
-VARIABLES = 'DEBUG DESTDIR HOME ICU_DATA ICU_TIMEZONE_FILES_DIR LANG LC_ALL PATH PWD ROOT TMPDIR TZ TZDIR'
+    'unparsed': 'Cannot parse version string {0}{1}\nCannot parse version string {0}'}
+# No start may heed these; AddressSanitizer does, and cannot look for leaks under a tracer.
+VARIABLES = 'DEBUG DESTDIR HOME ICU_DATA ICU_TIMEZONE_FILES_DIR LANG LC_ALL PATH ROOT TZ TZDIR'
 ENVIRONMENT = {**dict.fromkeys(VARIABLES.split(), '/elsewhere'), 'ASAN_OPTIONS': 'detect_leaks=0'}
+command = ['/mira_tzlinks', '--version', '/elsewhere']
 
 WORDS = {'system': f'link {SYSTEM}', 'file': 'file', 'directory': 'directory', 'none': None}
 KINDS = {'-rw-r--r--': 'file', 'drwxr-xr-x': 'directory', 'lrwxrwxrwx': 'link'}
 OLD = 2208988800, 2**31 - 1  # 2040, and what that is on a file system whose dates end before
-command = ['/mira_tzlinks']
 harness = None  # in a device, a snapshot of what it holds for our sake
 
 
-def put(path, what=None):
-    """Puts at the path, in place of what is there, what a snapshot shows so; by None nothing."""
-    if harness is None:
-        sys.exit('this is no device')
-    shutil.rmtree(path, ignore_errors=True)
-    if os.path.lexists(path):
-        os.remove(path)
-    os.makedirs(os.path.dirname(path), exist_ok=True)
-    kind, _, content = (what or '').partition(' ')
-    if kind == 'link':
-        os.symlink(content, path)
-    elif kind == 'directory':
-        os.mkdir(path)
-    elif kind == 'file':
-        with open(path, 'wb') as file:
-            file.write(os.fsencode(content))
+def put(tree):
+    """Puts at each path of the tree, in place of what is there, what a snapshot shows so, or nothing
+    by None."""
+    assert harness is not None, 'outside of a device'
+    for path, what in tree.items():
+        shutil.rmtree(path, ignore_errors=True)
+        if os.path.lexists(path):
+            os.remove(path)
+        os.makedirs(os.path.dirname(path), exist_ok=True)
+        kind, _, content = (what or '').partition(' ')
+        if kind == 'file':
+            with open(path, 'wb') as file:
+                file.write(os.fsencode(content))
+        elif kind:
+            os.mkdir(path) if kind == 'directory' else os.symlink(content, path)
 
 
 def snapshot():
-    """Returns, by path, what is on the device: `link TEXT`, `file CONTENT` or `directory`, with the
-    mode for the word where it is not the usual one, and ` *` behind it unless its time is OLD."""
+    """Returns, by path, what is on the device: `link TEXT`, `file CONTENT` or `directory`, an unusual
+    mode in place of the word, and ` *` behind it unless its time is OLD."""
     seen = {}
     for parent, directories, files in os.walk('/'):
         directories[:] = [name for name in directories if name != 'proc']
@@ -75,104 +70,90 @@ def snapshot():
             status = os.lstat(path)
             mode, content = stat.filemode(status.st_mode), ''
             if mode[0] == 'l':
-                content = f' {os.readlink(path)}'
+                content = ' ' + os.readlink(path)
             elif mode[0] == '-' and status.st_size:
                 with open(path, 'rb') as file:
-                    content = f' {os.fsdecode(file.read())}'
+                    content = ' ' + os.fsdecode(file.read())
             seen[path] = KINDS.get(mode, mode) + content + ' *' * (int(status.st_mtime) not in OLD)
     return seen
 
 
-def install_system(version, icu_format='44l'):
-    """Installs the system dataset, with a file that would be data in an update."""
-    put(f'{SYSTEM}/+VERSION', f'file {version}\n')
-    put(f'{SYSTEM}/Asia/Tokyo', 'file')
-    put(f'{SYSTEM_ICU}/icutzformat.txt', f'file {icu_format}\n')
-    put(f'{SYSTEM_ICU}/icutz77e.dat', 'file')
+def system_dataset(version):
+    """Returns the tree of the system dataset, with a file that would be data in an update."""
+    return {f'{SYSTEM}/+VERSION': f'file {version}\n', f'{SYSTEM}/Asia/Tokyo': 'file',
+            f'{SYSTEM_ICU}/icutzformat.txt': 'file 44l\n', f'{SYSTEM_ICU}/icutz77e.dat': 'file'}
 
 
-def install_update(version):
-    """Installs an update, with texts that would count in the system dataset; some have other formats."""
-    icu_format = {'2017': '48l', '2018': '44b'}.get(version[:4], '44l')
-    put(f'{DATASETS}/{version}/zoneinfo/+VERSION', 'file 1999z\n')
-    put(f'{DATASETS}/{version}/icutz/icutz{icu_format}.dat', 'file')
-    put(f'{DATASETS}/{version}/icutz/icutzformat.txt', 'file 77e\n')
+def update(version):
+    """Returns the tree of an update, with texts that would count in the system dataset."""
+    path, icu_format = f'{DATASETS}/{version}', '48l' if version.startswith('2017') else '44l'
+    return {f'{path}/zoneinfo/+VERSION': 'file 1999z\n', f'{path}/icutz/icutzformat.txt': 'file 77e\n',
+            f'{path}/icutz/icutz{icu_format}.dat': 'file'}
 
 
 def data_links(version):
-    """Returns, by path, the data links while a version, or "system", is current."""
-    if version == 'system':
-        return {ZONEINFO: f'link {SYSTEM}', ICU: None}
-    return {path: f'link {DATASETS}/{version}/{os.path.basename(path)}' for path in (ZONEINFO, ICU)}
+    """Returns the tree of the data links while a version, or "system", is current."""
+    dataset = f'link {DATASETS}/{version}/'
+    return {ZONEINFO: WORDS.get(version, dataset + 'zoneinfo'),
+            ICU: None if version in WORDS else dataset + 'icutz'}
 
 
 def switched(current, latest):
-    """Returns, by path, what a switch from one version to another changes."""
+    """Returns the tree of what a switch from one version to another changes."""
     return data_links(latest) | {RECORD: f'file {current}_{latest}'}
 
 
 def lay_out(current='system', latest='none', localtime=f'{ZONEINFO}/Asia/Tokyo', system='2016f'):
-    """Makes the device anew. The zoneinfo, the latest and the local-time link have a text that begins
-    with a slash or a dot, are one of WORDS, or lead to an update of a version."""
-    put('/usr/share')
-    put('/var')
-    put(DATASETS, 'directory')
-    install_system(system)
-    links = {ZONEINFO: current, LATEST: latest, LOCALTIME: localtime, ICU: './stale'}
-    links = {path: WORDS.get(text, f'link {text}') for path, text in links.items()}
-    versions = [text for text in (current, latest) if text not in WORDS and text[0] not in './']
-    for version in versions:
-        install_update(version)
-    if latest in versions:
-        links[LATEST] = f'link {DATASETS}/{latest}'
-    for path, what in (links | (data_links(current) if current in versions else {})).items():
-        put(path, what)
+    """Makes the device anew. A link has a text that begins with a slash or dot, is one of WORDS, or
+    leads to the update of a version, which is then installed."""
+    put({'/usr/share': None, '/var': None})
+    put({DATASETS: 'directory', ICU: 'link ./stale', **system_dataset(system)})
+    for path, text in (ZONEINFO, current), (LATEST, latest), (LOCALTIME, localtime):
+        if text in WORDS or text[0] in './':
+            put({path: WORDS.get(text, f'link {text}')})
+        else:
+            links = data_links(text) if path == ZONEINFO else {path: f'link {DATASETS}/{text}'}
+            put(update(text) | links)
 
 
 def lay_out_busy():
     """Lays out a device whose next start changes all it can; returns its warnings and changes."""
     lay_out('2016e.1.0', '2016g.1.0', '/usr/share/zoneinfo/No/Zone')
-    changes = {LOCALTIME: f'link {DEFAULT_ZONE}', MARKER: 'file', **switched('2016f.1.0', '2016g.1.0')}
-    error = 'No such file or directory'
-    return ['incompatible', f'correcting={ZONEINFO}/No/Zone', f'reset_zone: {error}'], changes
+    return (['incompatible', f'correcting={ZONEINFO}/No/Zone', 'reset_zone'],
+            switched('2016f.1.0', '2016g.1.0') | {LOCALTIME: DEFAULT_ZONE, MARKER: 'file'})
 
 
 def run(*before, prepare=None):
-    """Runs the program to its end, behind the words of another command and after a call of `prepare`
-    in its process; returns it with its output and status."""
-    process = subprocess.run([*before, *command, *ARGUMENTS], env=ENVIRONMENT, preexec_fn=prepare,
-                             stdin=subprocess.DEVNULL, capture_output=True, timeout=20)
+    """Runs the program to its end, behind a command and after a call of `prepare`, if any."""
+    process = subprocess.run([*before, *command], env=ENVIRONMENT, preexec_fn=prepare, timeout=20,
+                             stdin=subprocess.DEVNULL, capture_output=True)
     if b'PTRACE' in process.stderr:
         sys.exit(f'system calls cannot be traced here: {os.fsdecode(process.stderr)}')
     return process
 
 
 def start(warnings=(), changes={}, status=0, before=(), prepare=None):
-    """Runs the program and checks its warnings, its exit status, and all that it changes, by path. A
-    warning has `: ERROR` where a call has just failed, and elsewhere is taken with any error."""
+    """Runs the program and checks its warnings, its exit status, and the tree of all its changes. A
+    warning has `: ERROR` where a call has just failed, and any error is taken elsewhere."""
     for path in snapshot():
         os.utime(path, (OLD[0], OLD[0]), follow_symlinks=False)
     expected = snapshot()
     process = run(*before, prepare=prepare)
-    seen = snapshot()
+    seen = snapshot().items()
     for path, what in changes.items():
         parent = os.path.dirname(path)
         expected |= {parent: expected[parent].removesuffix(' *') + ' *', path: what and f'{what} *'}
-    expected = {path: what for path, what in expected.items() if what}
+    expected = {path: what for path, what in expected.items() if what}.items()
     texts = []
     for warning in warnings:
         word, colon, error = warning.partition(': ')
         name, _, argument = word.partition('=')
-        text = WARNINGS.get(name, word).format(argument) + colon + error
+        text = WARNINGS.get(name, word).format(argument, ', results.size() = 0') + colon + error
         texts += [f'mira_tzlinks: {line}' for line in re.split('\n(?=Cannot)', text)]
     lines = re.split(r'\n(?=mira_tzlinks: |\Z)', os.fsdecode(process.stdout + process.stderr))
     lines = [line if line in texts else re.sub(': [A-Z][^:]*$', '', line) for line in lines]
-    compare([*texts, '', f'exit status {status}', *difference(expected, seen)],
-            [*lines, f'exit status {process.returncode}', *difference(seen, expected)])
-
-
-def difference(tree, other):
-    return sorted(f'{path}: {what}' for path, what in tree.items() - other.items())
+    compare([*texts, '', f'exit status {status}', *map(': '.join, sorted(expected - seen))],
+            [*lines, f'exit status {process.returncode}', *map(': '.join, sorted(seen - expected))])
 
 
 def compare(expected, seen):
@@ -184,43 +165,41 @@ def compare(expected, seen):
 
 
 def main(*tools):
-    """Runs the tests of a script in a device beside PROGRAM: functions named test_..., or calls of one
-    with the cells of each row of the table in its text; those that have every WORD in their titles."""
-    if len(sys.argv) == 1:
-        sys.exit(f'usage: {sys.argv[0]} [EMULATOR;]PROGRAM [WORD...]')
+    """Runs the tests of a script in a device beside PROGRAM: its functions named test_..., once or
+    with each row of the table in their text, those that have every WORD in their titles."""
     *emulator, program = sys.argv[1].split(';')
     command[:0] = [f'/{os.path.basename(path)}' for path in emulator]
     tests = []
-    for name, function in vars(__main__).items():
+    for name, function in vars(sys.modules['__main__']).items():
         if name.startswith('test_'):
             text, _, table = (function.__doc__ or '').partition('\n\n')
-            first = function.__code__.co_firstlineno + text.count('\n') + 3
-            rows = [*enumerate(table.splitlines(), first)][1:-1] or [(first - 3, '')]
-            tests += [(line, f'{name} {row}', function, row) for line, row in rows]
-    tests = [test for test in tests if all(word in test[1] for word in sys.argv[2:])]
+            first = function.__code__.co_firstlineno + text.count('\n') + 4
+            for line, row in enumerate(table.splitlines()[1:-1] or [''], first):
+                tests.append((f'{sys.argv[0]}:{line}: {name} {row}', function, row))
+    tests = [test for test in tests if all(word in test[0] for word in sys.argv[2:])]
 
     def run_tests():
-        for line, title, function, row in tests:
+        for title, function, row in tests:
             try:
                 function(*row.partition('#')[0].format(**globals()).split())
             except BaseException:
-                print(f'{sys.argv[0]}:{line}: {title}', file=sys.stderr)
+                print(title, file=sys.stderr)
                 raise
         print(f'{len(tests)} passed')
         return tests
 
-    script = os.path.basename(sys.argv[0]).removesuffix('.py')
-    in_device(run_tests, program, f'{os.path.dirname(program)}/device.{script}', [*emulator, *tools])
+    place = f'{os.path.dirname(program)}/device.{os.path.basename(sys.argv[0])}'
+    in_device(run_tests, program, place.removesuffix('.py'), [*emulator, *tools])
 
 
 def in_device(action, program, place, tools=(), keep=False):
-    """Makes the directory `place` a device with the program and the tools, calls `action` in it, and
-    ends this process, with 0 when that returned true. Removes the device unless the action failed or
-    `keep` is true. Another user becomes root for that, in a user namespace or by sudo."""
+    """Makes the directory `place` a device with the program and the tools, calls `action` in it and
+    ends this process, with 0 when that returned true. Keeps the device when it did not, or if asked.
+    Another user becomes root for that, in a user namespace or by sudo."""
     become_root()
     signals = signal.SIGINT, signal.SIGTERM, signal.SIGHUP, signal.SIGCHLD
     signal.pthread_sigmask(signal.SIG_BLOCK, signals[:3])
-    ctypes.CDLL(None).prctl(1, signal.SIGTERM)  # once our own parent has ended
+    ctypes.CDLL(None).prctl(1, signal.SIGTERM)  # for when our own parent has ended
     os.umask(0o022)
     os.makedirs(place, exist_ok=True)
     lock = os.open(place, os.O_DIRECTORY | os.O_NOFOLLOW)
@@ -265,32 +244,27 @@ def empty(place):
 
 
 def enter(place, program, tools):
-    """Furnishes the device with the program, the tools and what they need, and makes it the root."""
+    """Furnishes the device with the program and the tools, and makes it the root directory."""
     global harness
-    copies = {path: path for path in map(os.path.abspath, (sys.argv[0], __file__))}  # for a traceback
-    for name, path in {'mira_tzlinks': program, **{tool: shutil.which(tool) for tool in tools}}.items():
+    copies = {'/dev/null': '/dev/null', '/trace': '/dev/null', '/mira_tzlinks': program}
+    copies |= {f'/{os.path.basename(tool)}': shutil.which(tool) for tool in tools}
+    for name, path in [*copies.items()][2:]:
         if not path or not os.path.isfile(path):
             sys.exit(f'there is no {path or name}')
-        ldd = subprocess.run(['ldd', path], capture_output=True, text=True).stdout
+        ldd = subprocess.run(['ldd', path], env={}, capture_output=True, text=True).stdout
         copies |= {path: path for path in re.findall(r'\t(?:\S+ => )?(/\S+) \(0x', ldd)}
-        copies[f'/{os.path.basename(name)}'] = path
-    for name, path in (copies | {'/dev/null': '/dev/null', '/trace': '/dev/null'}).items():
+    for name, path in copies.items():
         os.makedirs(os.path.dirname(place + name), exist_ok=True)
         shutil.copyfile(path, place + name)
         shutil.copymode(path, place + name)
     with open(program, 'rb') as file:
         if b'__asan_init' in file.read():  # AddressSanitizer reads /proc
-            show_proc(place)
+            os.mkdir(f'{place}/proc')
+            if ctypes.CDLL(None).unshare(0x20000) != 0:
+                sys.exit('AddressSanitizer takes a mount namespace, which is refused here')
+            for words in ['--make-rprivate', '/'], ['--rbind', '/proc', f'{place}/proc']:
+                subprocess.run(['mount', *words], check=True)
     os.chroot(place)
     os.chdir('/')
     harness = {}
     harness = snapshot()
-
-
-def show_proc(place):
-    """Mounts /proc in the device, in a mount namespace of this process."""
-    if ctypes.CDLL(None).unshare(0x20000) != 0:
-        sys.exit('AddressSanitizer reads /proc, which takes a mount namespace')
-    os.mkdir(f'{place}/proc')
-    for words in ['--make-rprivate', '/'], ['--rbind', '/proc', f'{place}/proc']:
-        subprocess.run(['mount', *words], check=True)

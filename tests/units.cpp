@@ -5,6 +5,7 @@
 
 #include <cerrno>
 #include <cstdio>
+#include <cstdlib>
 #include <stdexcept>
 
 constexpr char expected[] = R"(
@@ -48,6 +49,7 @@ int main() {
     }
     std::fclose(stderr);
     std::string seen = text;
+    std::free(text);
     std::erase(seen, 'x');
     std::fputs(seen == expected ? "passed\n" : seen.c_str(), stdout);
     return seen == expected ? 0 : 1;
