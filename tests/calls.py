@@ -84,7 +84,7 @@ def test_disturbed(current, latest, *losses):
         return {(name, seen.get(path, '').removesuffix(' *')) for path, name in FILES.items()}
 
     start_but('rename:error=EIO')  # which no start calls
-    calls, undisturbed, lost = trace(), files(), set()
+    calls, undisturbed, lost, path = trace(), files(), set(), None
     run()
     undisturbed |= files()
     for name, number, line in calls:

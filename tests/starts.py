@@ -74,7 +74,8 @@ def test_local_time(link, then):
     put({f'{DATASETS}/2016g.1.0/zoneinfo/{zone}': 'file' for zone in ('Asia/Tokyo', 'New/Zone')})
     put({'/var/db/icu/entry': 'file'})  # so that it cannot be removed
     corrected = link.replace('/usr/share/zoneinfo', ZONEINFO, 1)
-    changes = {'kept': {}, 'corrected': {LOCALTIME: f'link {corrected}'}}.get(then, {LOCALTIME: DEFAULT_ZONE})
+    changes = {'kept': {}, 'corrected': {LOCALTIME: f'link {corrected}'}}.get(
+        then, {LOCALTIME: DEFAULT_ZONE})
     start([f'no_link={LOCALTIME}'] * (link == 'directory')
           + [f'correcting={corrected}'] * (then in ('corrected', 'tried'))
           + ['reset_zone'] * (then in ('tried', 'reset')), switched('2016f.1.0', '2016g.1.0') | changes)
@@ -124,7 +125,8 @@ def test_icu_format():
     cases += [(None, '44l.dat', 'file', 0o770), (None, '44l.dat', 'link icutzformat.txt', 0o644),
               (None, '44l.dat', 'directory', 0o755)]
     cases += [(text, f'{text}.dat', 'file', 0o004) for text in ('44l', '2015b', '0e', '9l')]
-    cases += [('4l', '44l.dat', 'file', 0), ('44L', '44l.dat', 'file', 4), ('junk', '44x.dat', 'file', 4)]
+    cases += [('4l', '44l.dat', 'file', 0), ('44L', '44l.dat',
+                                             'file', 4), ('junk', '44x.dat', 'file', 4)]
     for system, name, what, mode in cases:
         lay_out(latest='2016g.1.0')
         put({f'{SYSTEM_ICU}/icutzformat.txt': system and f'file \t{system}\nmore',
