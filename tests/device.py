@@ -35,7 +35,7 @@ WARNINGS = {
 # No start may heed these; AddressSanitizer does, and cannot look for leaks under a tracer.
 VARIABLES = 'DEBUG DESTDIR HOME ICU_DATA ICU_TIMEZONE_FILES_DIR LANG LC_ALL PATH ROOT TZ TZDIR'
 ENVIRONMENT = {**dict.fromkeys(VARIABLES.split(), '/elsewhere'), 'ASAN_OPTIONS': 'detect_leaks=0'}
-command = ['/mira_tzlinks', '--version', '/elsewhere']
+command = ['/mira_tzlinks', '--version', '-n', '/elsewhere']
 
 WORDS = {'system': f'link {SYSTEM}', 'file': 'file', 'directory': 'directory', 'none': None}
 KINDS = {'-rw-r--r--': 'file', 'drwxr-xr-x': 'directory', 'lrwxrwxrwx': 'link'}
@@ -44,8 +44,7 @@ harness = None  # in a device, a snapshot of what it holds for our sake
 
 
 def put(tree):
-    """Puts at each path of the tree, in place of what is there, what a snapshot shows so, or nothing
-    by None."""
+    """Puts at each path, in place of what is there, what a snapshot shows so; by None nothing."""
     assert harness is not None, 'outside of a device'
     for path, what in tree.items():
         shutil.rmtree(path, ignore_errors=True)
@@ -61,8 +60,8 @@ def put(tree):
 
 
 def snapshot():
-    """Returns, by path, what is on the device: `link TEXT`, `file CONTENT` or `directory`, an unusual
-    mode in place of the word, and ` *` behind it unless its time is OLD."""
+    """Returns, by path, what is on the device: `link TEXT`, `file CONTENT` or `directory`, an
+    unusual mode in place of the word, and ` *` behind it unless its time is OLD."""
     seen = {}
     for parent, directories, files in os.walk('/'):
         directories[:] = [name for name in directories if name != 'proc']
@@ -87,7 +86,7 @@ def system_dataset(version):
 def update(version):
     """Returns the tree of an update, with texts that would count in the system dataset."""
     path, icu_format = f'{DATASETS}/{version}', '48l' if version.startswith('2017') else '44l'
-    return {f'{path}/zoneinfo/+VERSION': 'file 1999z\n', f'{path}/icutz/icutzformat.txt': 'file 77e\n',
+    return {f'{path}/zoneinfo/+VERSION': 'file 1999z', f'{path}/icutz/icutzformat.txt': 'file 77e',
             f'{path}/icutz/icutz{icu_format}.dat': 'file'}
 
 
@@ -104,12 +103,12 @@ def switched(current, latest):
 
 
 def lay_out(current='system', latest='none', localtime=f'{ZONEINFO}/Asia/Tokyo', system='2016f'):
-    """Makes the device anew. A link has a text that begins with a slash or dot, is one of WORDS, or
-    leads to the update of a version, which is then installed."""
+    """Makes the device anew. A link has a text that begins with a slash, a dot or `tz/`, is one of
+    WORDS, or leads to the update of a version, which is then installed."""
     put({'/usr/share': None, '/var': None})
     put({DATASETS: 'directory', ICU: 'link ./stale', **system_dataset(system)})
     for path, text in (ZONEINFO, current), (LATEST, latest), (LOCALTIME, localtime):
-        if text in WORDS or text[0] in './':
+        if text in WORDS or text.startswith(('/', '.', 'tz/')) or path == LOCALTIME:
             put({path: WORDS.get(text, f'link {text}')})
         else:
             links = data_links(text) if path == ZONEINFO else {path: f'link {DATASETS}/{text}'}
@@ -194,7 +193,7 @@ def main(*tools):
 
 def in_device(action, program, place, tools=(), keep=False):
     """Makes the directory `place` a device with the program and the tools, calls `action` in it and
-    ends this process, with 0 when that returned true. Keeps the device when it did not, or if asked.
+    ends this process, with 0 when that returned true. Keeps the device when it did not or if asked.
     Another user becomes root for that, in a user namespace or by sudo."""
     become_root()
     signals = signal.SIGINT, signal.SIGTERM, signal.SIGHUP, signal.SIGCHLD

@@ -4,41 +4,46 @@
 import os
 import resource
 
-from device import (DATASETS, DEFAULT_ZONE, ICU, LOCALTIME, MARKER, RECORD, SYSTEM, SYSTEM_ICU, WORDS,
-                    ZONEINFO, data_links, lay_out, lay_out_busy, main, put, start, switched)
+from device import (DATASETS, DEFAULT_ZONE, ICU, LATEST, LOCALTIME, MARKER, RECORD, SYSTEM,
+                    SYSTEM_ICU, TZ, WORDS, ZONEINFO, data_links, lay_out, lay_out_busy, main, put,
+                    start, switched)
 
 
 def test_dataset(current, latest, then, marker, record, *warnings):
     """Which dataset is current after a start, by the one that was and by the latest: that of the
     system, which has 2016f, the update of a version, or what another text of the link names.
 
-    current         latest        then current  marker  record               warnings
-    system          none          system        none    -
-    system          2016g.1.0     2016g.1.0     none    2016f.1.0_2016g.1.0
-    system          2016f.1.0     system        none    -                    not_taken
-    system          2017a.1.0     system        none    -                    not_taken  # other ICU data
-    2016g.1.0       none          2016g.1.0     none    -
-    2016f.1.0       2016g.1.0     2016g.1.0     file    2016f.1.0_2016g.1.0
-    2016e.1.0       none          system        file    -                    incompatible
-    2016e.1.0       2016g.1.0     2016g.1.0     file    2016f.1.0_2016g.1.0  incompatible
-    2016d.1.0       2016e.1.0     2016e.1.0     file    2016f.1.0_2016e.1.0  incompatible
-    2017a.1.0       2016h.1.0     system        file    -                    incompatible not_taken
-    2147483648a     none          system        none    -                    no_data
-    2016g.1.0       2147483648a   system        none    -                    no_data
-    2016g.1.0       {LONG}cut     system        none    -                    bad_path={LONG} no_data
-    2016g.1.0       {TZ}/tz/      system        none    -                    bad_path no_data
-    2016g.1.0       {TZ}/tzx/1a   system        none    -                    bad_path no_data
-    2016e.1.0       /x{TZ}/tz/1a  system        file    -                    incompatible bad_path no_data
-    2016g.1.0       file          system        none    -                    no_link={LATEST} no_data
-    file            none          system        none    -                    no_link={ZONEINFO} bad_links
-    none            none          system        none    -                    bad_link= bad_links
-    {SYSTEM}/       none          system        none    -                    bad_link bad_links
-    {TZ}/tz/1a      none          system        none    -                    bad_link bad_links
-    {TZ}/tz//x      none          system        none    -                    bad_link bad_links
-    {TZ}/tzx/1a/x   none          system        none    -                    bad_link bad_links
-    /x{TZ}/tz/1a/x  2016g.1.0     2016g.1.0     none    2016f.1.0_2016g.1.0  bad_link bad_links
-    {TZ}/tz/x/      none          system        file    -                    unparsed=x incompatible
-    {TZ}/tz/1a/b/c  none          system        file    -                    unparsed=1a/b incompatible
+    current        latest       then      marker record              warnings
+    system         none         system    none   -
+    system         2016g.1.0    2016g.1.0 none   2016f.1.0_2016g.1.0
+    system         2016f.1.0    system    none   -                   not_taken
+    system         2017a.1.0    system    none   -                   not_taken # other ICU data
+    2016g.1.0      none         2016g.1.0 none   -
+    2016f.1.0      2016g.1.0    2016g.1.0 file   2016f.1.0_2016g.1.0
+    2016e.1.0      none         system    file   -                   incompatible
+    2016e.1.0      2016g.1.0    2016g.1.0 file   2016f.1.0_2016g.1.0 incompatible
+    2016d.1.0      2016e.1.0    2016e.1.0 file   2016f.1.0_2016e.1.0 incompatible
+    2017a.1.0      2016h.1.0    system    file   -                   incompatible not_taken
+    2017a.1.0      2017b.1.0    system    file   -                   incompatible not_taken
+    system         2016g.1.0/   system    none   -                   unparsed=2016g.1.0/ not_taken
+    2147483648a    none         system    none   -                   no_data
+    2016g.1.0      2147483648a  system    none   -                   no_data
+    2016g.1.0      {LONG}cut    system    none   -                   bad_path={LONG} no_data
+    2016g.1.0      {TZ}/tz/     system    none   -                   bad_path no_data
+    2016g.1.0      {TZ}/tzx/1a  system    none   -                   bad_path no_data
+    2016e.1.0      /x{TZ}/tz/1a system    file   -                   incompatible bad_path no_data
+    2016g.1.0      tz/2016h.1.0 system    none   -                   bad_path no_data
+    2016g.1.0      file         system    none   -                   no_link={LATEST} no_data
+    file           none         system    none   -                   no_link={ZONEINFO} bad_links
+    none           none         system    none   -                   bad_link= bad_links
+    {SYSTEM}/      none         system    none   -                   bad_link bad_links
+    tz/2016g.1.0/x none         system    none   -                   bad_link bad_links
+    {TZ}/tz/1a     none         system    none   -                   bad_link bad_links
+    {TZ}/tz//x     none         system    none   -                   bad_link bad_links
+    {TZ}/tzx/1a/x  none         system    none   -                   bad_link bad_links
+    /x{TZ}/tz/1a/x 2016g.1.0    2016g.1.0 none   2016f.1.0_2016g.1.0 bad_link bad_links
+    {TZ}/tz/x/     none         system    file   -                   unparsed=x incompatible
+    {TZ}/tz/1a/b/c none         system    file   -                   unparsed=1a/b incompatible
     """
     lay_out(current, latest, './nowhere')
     put({MARKER: 'directory', RECORD: 'file of an earlier switch', '/var/db/icu': 'directory'})
@@ -60,6 +65,7 @@ def test_local_time(link, then):
     {ZONEINFO}X                             kept
     /usr/share/zoneinfo/Asia/Tokyo          corrected
     /usr/share/zoneinfo                     corrected
+    /usr/share/zoneinfo/                    corrected
     /usr/share/zoneinfo/New/Zone            corrected
     /usr/share/zoneinfo/Asia/Tokyo/Zone     tried
     /usr/share/zoneinfo.default/Asia/Tokyo  tried
@@ -67,6 +73,7 @@ def test_local_time(link, then):
     /var/db/timezone/zoneinf                reset
     /x{ZONEINFO}/Asia/Tokyo                 reset
     ../zoneinfo/Asia/Tokyo                  reset
+    zoneinfo/Asia/Tokyo                     reset
     none                                    reset
     directory                               reset
     """
@@ -78,12 +85,13 @@ def test_local_time(link, then):
         then, {LOCALTIME: DEFAULT_ZONE})
     start([f'no_link={LOCALTIME}'] * (link == 'directory')
           + [f'correcting={corrected}'] * (then in ('corrected', 'tried'))
-          + ['reset_zone'] * (then in ('tried', 'reset')), switched('2016f.1.0', '2016g.1.0') | changes)
+          + ['reset_zone'] * (then in ('tried', 'reset')),
+          switched('2016f.1.0', '2016g.1.0') | changes)
 
 
 def test_order_of_versions():
     ranks = '''x | 0a | 2014a | 2014a.0 2014a.00 | 2014a.1 | 2014a.1.0 | 2014a.1.9 | 2014a.2 |
-        2014a.010 02014a.10 | 2014aa | 2014az.7.1 | 2014b | 2014z.9.9 | 2015a | 10000a | 2147483647a'''
+        2014a.010 02014a.10 | 2014aa | 2014az.7 | 2014b | 2014z.9 | 2015a | 10000a | 2147483647a'''
     versions = [(rank, text) for rank, row in enumerate(ranks.split('|')) for text in row.split()]
     for old, current in versions:
         for new, latest in versions:
@@ -94,10 +102,10 @@ def test_order_of_versions():
 
 
 def test_version_refused():
-    for text in ('2014', 'a', 'a2014', '2014A', '2014aA', '2014a.', '2014a.b', '2014a.1b', '2014a.1.',
-                 '2014a1', '2014a.1.0.2', '2014a..1', '2014a+1', '2014a.1+0', ' 2014a', '2014a ',
-                 '2014a\n', '+2014a', '2014a.-1', '2014\udce9', '2014`', '2014{', '201/a', '201:a',
-                 '2014a./', '2014a.1.:'):
+    for text in ('2014', 'a', 'a2014', '2014A', '2014aA', '2014a.', '2014a.b', '2014a.1b',
+                 '2014a.1.', '2014a1', '2014a.1.0.2', '2014a..1', '2014a+1', '2014a.1+0', ' 2014a',
+                 '2014a ', '2014a\n', '+2014a', '2014a.-1', '2014\udce9', '2014`', '2014{', '201/a',
+                 '201:a', '2014a./', '2014a.1.:'):
         lay_out(latest=text)
         start([f'unparsed={text}', 'not_taken'])
 
@@ -120,13 +128,13 @@ def test_version_of_the_system():
 def test_icu_format():
     data, taken = f'{DATASETS}/2016g.1.0/icutz', switched('2016f.1.0', '2016g.1.0')
     cases = [(None, name, 'file', 0o644) for name in (  # none has a format, and nor has the system
-        '44L.dat 44x.dat l.dat 44.dat 44l.dat.bak 44l.DAT 44lxdat 4ldat :l.dat 4\udcb2l.dat -4l.dat '
-        '/l.dat /icutz44l.dat /../xicutz44l.dat').split()]
+        '44L.dat 44x.dat l.dat 44.dat 44l.dat.bak 44l.DAT 44lxdat 4ldat :l.dat 4\udcb2l.dat '
+        '-4l.dat /l.dat /icutz44l.dat /../xicutz44l.dat').split()]
     cases += [(None, '44l.dat', 'file', 0o770), (None, '44l.dat', 'link icutzformat.txt', 0o644),
               (None, '44l.dat', 'directory', 0o755)]
     cases += [(text, f'{text}.dat', 'file', 0o004) for text in ('44l', '2015b', '0e', '9l')]
-    cases += [('4l', '44l.dat', 'file', 0), ('44L', '44l.dat',
-                                             'file', 4), ('junk', '44x.dat', 'file', 4)]
+    cases += [('44lx', '44l.dat', 'file', 4), ('4l', '44l.dat', 'file', 4),
+              ('44L', '44l.dat', 'file', 4), ('junk', '44x.dat', 'file', 4)]
     for system, name, what, mode in cases:
         lay_out(latest='2016g.1.0')
         put({f'{SYSTEM_ICU}/icutzformat.txt': system and f'file \t{system}\nmore',
@@ -159,6 +167,14 @@ def test_link_cannot_be_made():
            f'create_symlink: from {LOCALTIME} to {DEFAULT_ZONE[5:]}: File exists'], status=1)
 
 
+def test_directory_of_the_links_is_a_file():
+    lay_out()
+    put({TZ: 'file'})
+    texts = ('read_symlink: ' + LATEST, 'no_data', 'remove: could not remove ' + ZONEINFO,
+             'Unlink of zoneinfo softlink failed', f'create_symlink: from {ZONEINFO} to {SYSTEM}')
+    start([f'{text}: Not a directory' for text in texts], status=1)
+
+
 def test_odd_surroundings():
     for prepare in lambda: os.close(2), lambda: os.dup2(os.pipe()[1], 2):  # whose reader ends
         start((), lay_out_busy()[1], prepare=prepare)
@@ -168,7 +184,8 @@ def test_odd_surroundings():
     lay_out_busy()
     put({f'{MARKER}/entry': 'file'})
     warnings[1:1] = [f'Cannot touch file {MARKER}: Is a directory']
-    start(warnings, {path: what for path, what in changes.items() if path != MARKER} | {RECORD: 'file'},
+    del changes[MARKER]
+    start(warnings, changes | {RECORD: 'file'},
           prepare=lambda: resource.setrlimit(resource.RLIMIT_FSIZE, (0, 0)))
 
 
