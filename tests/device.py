@@ -35,7 +35,7 @@ WARNINGS = {
 # No start may heed these; AddressSanitizer does, and cannot look for leaks under a tracer.
 VARIABLES = 'DEBUG DESTDIR HOME ICU_DATA ICU_TIMEZONE_FILES_DIR LANG LC_ALL PATH ROOT TZ TZDIR'
 ENVIRONMENT = {**dict.fromkeys(VARIABLES.split(), '/elsewhere'), 'ASAN_OPTIONS': 'detect_leaks=0'}
-command = ['/mira_tzlinks', '--version', '-n', '/elsewhere']
+command = ['/mira_tzlinks', '-n', '--version', '/elsewhere']
 
 WORDS = {'system': f'link {SYSTEM}', 'file': 'file', 'directory': 'directory', 'none': None}
 KINDS = {'-rw-r--r--': 'file', 'drwxr-xr-x': 'directory', 'lrwxrwxrwx': 'link'}
