@@ -35,7 +35,7 @@ def test_dataset(current, latest, then, marker, record, *warnings):
     2016g.1.0      tz/2016h.1.0 system    none   -                   bad_path no_data
     2016g.1.0      file         system    none   -                   no_link={LATEST} no_data
     file           none         system    none   -                   no_link={ZONEINFO} bad_links
-    none           none         system    none   -                   bad_link= bad_links
+    none           none         system    none   -                   no_zoneinfo bad_links
     {SYSTEM}/      none         system    none   -                   bad_link bad_links
     tz/2016g.1.0/x none         system    none   -                   bad_link bad_links
     {TZ}/tz/1a     none         system    none   -                   bad_link bad_links
