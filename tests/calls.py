@@ -66,8 +66,8 @@ def test_calls_of_a_busy_start():
 
 
 def test_disturbed(current, latest, *losses):
-    """Every call on a file fails once: the start goes on to its end and leaves usable links.
-    And the power is cut before every call that changes a file: after one more start, some files are
+    """Every call on a file fails once: the start goes on to its end and leaves usable links,
+    and so does the next. And the power is cut before every call that changes a file: after one more start, some files are
     not what they are without the cut. The manual page has these losses, and no others, in CAVEATS.
 
     current    latest     losses, each behind the file that the call was for
@@ -77,31 +77,34 @@ def test_disturbed(current, latest, *losses):
     2016e.1.0  none       icu:icu local:local
     system     none       local:local
     """
-    def start_but(injection):
+    def start_traced(*injection):
         lay_out(current, latest, '/usr/share/zoneinfo')
-        return run(*STRACE, f'-einject={injection}')
+        return run(*STRACE, *injection)
+
+    def unusable():
+        return not os.path.isdir(ZONEINFO) or not os.readlink(LOCALTIME).startswith(ZONEINFO)
 
     def files():
         seen = snapshot()
         return {(name, seen.get(path, '').removesuffix(' *')) for path, name in FILES.items()}
 
-    start_but('rename:error=EIO')  # which no start calls
+    start_traced()
     calls, undisturbed, lost, path = trace(), files(), set(), None
     run()
     undisturbed |= files()
     for name, number, line in calls:
         path = (re.findall(r'"(/[^"]*)"', line) or [path])[-1]
         if '"/' in line or path == MARKER and re.search('stat|close', name):
-            process = start_but(f'{name}:error=EIO:when={number}')
-            faults = {'ends too early': process.returncode, 'no data': not os.path.isdir(ZONEINFO),
-                      'no local time': not os.readlink(LOCALTIME).startswith(ZONEINFO),
+            process = start_traced(f'-einject={name}:error=EIO:when={number}')
+            faults = {'ends too early': process.returncode, 'unusable links': unusable(),
+                      'not mended by the next start': run().returncode or unusable(),
                       'a call on no file': any('(-1,' in line for _, _, line in trace()),
                       'no format': path.endswith('.0/icutz') and b'locate' in process.stderr,
                       'marker': (path == MARKER and 'unlink' not in name)
                       != (b'touch' in process.stderr)}
             compare([], [f'{fault}: {line}' for fault, found in faults.items() if found])
         if re.search('unlink|symlink|O_CREAT|write.*"20', line):
-            compare([-9], [start_but(f'{name}:signal=KILL:when={number}').returncode])
+            compare([-9], [start_traced(f'-einject={name}:signal=KILL:when={number}').returncode])
             run()
             lost |= {f'{FILES[path]}:{name}' for name, _ in files() - undisturbed}
     compare(sorted(losses), sorted(lost))

@@ -176,10 +176,10 @@ def main(*tools):
     for name, function in vars(sys.modules['__main__']).items():
         if name.startswith('test_'):
             text, _, table = (function.__doc__ or '').partition('\n\n')
-            first = function.__code__.co_firstlineno + text.count('\n') + 4
+            first = function.__code__.co_firstlineno + (text.count('\n') + 4 if table else 0)
             for line, row in enumerate(table.splitlines()[1:-1] or [''], first):
-                tests.append((f'{sys.argv[0]}:{line}: {name} {row}', function, row))
-    tests = [test for test in tests if all(word in test[0] for word in sys.argv[2:])]
+                if all(word in f'{name} {row}' for word in sys.argv[2:]):
+                    tests.append((f'{sys.argv[0]}:{line}: {name} {row}', function, row))
 
     def run_tests():
         for title, function, row in tests:
@@ -199,6 +199,8 @@ def in_device(action, program, place, tools=(), keep=False):
     """Makes the directory `place` a device with the program and the tools, calls `action` in it and
     ends this process, with 0 when that returned true. Keeps the device when it did not or if asked.
     Another user becomes root for that, in a user namespace or by sudo."""
+    if missing := [path for path in (program, *tools) if not shutil.which(path)]:
+        sys.exit(f'there is no program {missing[0]}')
     become_root()
     signals = signal.SIGINT, signal.SIGTERM, signal.SIGHUP, signal.SIGCHLD
     signal.pthread_sigmask(signal.SIG_BLOCK, signals[:3])
@@ -251,9 +253,7 @@ def enter(place, program, tools):
     global harness
     copies = {'/dev/null': '/dev/null', '/trace': '/dev/null', '/mira_tzlinks': program}
     copies |= {f'/{os.path.basename(tool)}': shutil.which(tool) for tool in tools}
-    for name, path in [*copies.items()][2:]:
-        if not path or not os.path.isfile(path):
-            sys.exit(f'there is no {path or name}')
+    for path in [*copies.values()]:
         ldd = subprocess.run(['ldd', path], env={}, capture_output=True, text=True).stdout
         copies |= {path: path for path in re.findall(r'\t(?:\S+ => )?(/\S+) \(0x', ldd)}
     for name, path in copies.items():
