@@ -70,16 +70,14 @@ def story():
     invented = re.sub(zone, r'\g<0> 2025\n-7 - PDT', source, count=1)
 
     compile_tree(source, SYSTEM)
-    device.put({f'{SYSTEM}/+VERSION': f'file {first}\n'})
-    device.put({f'{device.SYSTEM_ICU}/icutzformat.txt': 'file 44l\n'})
-    device.put({DATASETS: 'directory'})
+    device.put({f'{SYSTEM}/+VERSION': f'file {first}\n', DATASETS: 'directory',
+                f'{device.SYSTEM_ICU}/icutzformat.txt': 'file 44l\n'})
     start(f'The first start: the system partition has {first}, and there is no link yet.',
           [f'bad_link=: {error}', f'bad_links: {error}', f'reset_zone: {error}'],
           {ZONEINFO: f'link {SYSTEM}', LOCALTIME: DEFAULT_ZONE}, '2025-01-15 04:00 -0800')
 
     compile_tree(invented, f'{dataset}/zoneinfo')
-    device.put({f'{dataset}/icutz/icutz44l.dat': 'file'})
-    device.put({LATEST: f'link {dataset}'})
+    device.put({f'{dataset}/icutz/icutz44l.dat': 'file', LATEST: f'link {dataset}'})
     start(f'The update {update} was installed: Los Angeles keeps summer time from 2025 on.', (),
           device.switched(f'{first}.1.0', f'{update}.1.0'), '2025-01-15 05:00 -0700',
           '(This demo has invented the update and its summer time.)')
@@ -93,9 +91,7 @@ the last colon is the last error of any system call: here it means nothing.)''')
     start(f'The system partition was upgraded to {upgrade}, past the update.',
           ['incompatible', 'not_taken'], device.data_links('system') | {MARKER: 'file'})
 
-    for path in LATEST, dataset:
-        device.put({path: None})
-    device.put({LOCALTIME: 'link /usr/share/zoneinfo/Asia/Tokyo'})
+    device.put({LATEST: None, dataset: None, LOCALTIME: 'link /usr/share/zoneinfo/Asia/Tokyo'})
     changes = {LOCALTIME: f'link {ZONEINFO}/Asia/Tokyo', MARKER: None}
     start('The old update was cleaned up, and local time was linked past the zoneinfo link.',
           [f'correcting={ZONEINFO}/Asia/Tokyo'], changes, '2025-01-15 21:00 +0900')

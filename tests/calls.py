@@ -67,8 +67,9 @@ def test_calls_of_a_busy_start():
 
 def test_disturbed(current, latest, *losses):
     """Every call on a file fails once: the start goes on to its end and leaves usable links,
-    and so does the next. And the power is cut before every call that changes a file: after one more start, some files are
-    not what they are without the cut. The manual page has these losses, and no others, in CAVEATS.
+    and so does the next. And the power is cut before every call that changes a file: after one more
+    start, some files are not what they are without the cut. The manual page has these losses, and
+    no others, in CAVEATS.
 
     current    latest     losses, each behind the file that the call was for
     system     2016g.1.0  icu:icu icu:record record:record local:local
