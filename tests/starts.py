@@ -1,10 +1,11 @@
 #!/usr/bin/env -S python3 -EsB
 """What a start finds, and what it makes of that."""
 
+import itertools
 import os
 import resource
 
-from device import (DATASETS, DEFAULT_ZONE, ICU, LATEST, LOCALTIME, MARKER, RECORD, SYSTEM,
+from device import (DATASETS, DEFAULT_ZONE, ICU, LATEST, LOCALTIME, MARKER, RECORD, RESET_ZONE, SYSTEM,
                     SYSTEM_ICU, TZ, WORDS, ZONEINFO, data_links, lay_out, lay_out_busy, main, put,
                     start, switched)
 
@@ -47,58 +48,52 @@ def test_dataset(current, latest, then, marker, record, *warnings):
     """
     lay_out(current, latest, './nowhere')
     put({MARKER: 'directory', RECORD: 'file of an earlier switch', '/var/db/icu': 'directory'})
-    changes = {LOCALTIME: DEFAULT_ZONE, MARKER: WORDS[marker], '/var/db/icu': None}
-    if current != then or {'bad_links', 'incompatible', 'no_data'}.intersection(warnings):
-        changes |= data_links(then)
-    if record != '-':
-        changes[RECORD] = f'file {record}'
+    changes = RESET_ZONE | {MARKER: WORDS[marker], '/var/db/icu': None}
+    changes |= data_links(then) if then != current else {}
+    changes |= {RECORD: f'file {record}'} if record != '-' else {}
     texts = {'bad_link': f'bad_link={current}', 'bad_path': f'bad_path={latest}'}
     start([*(texts.get(word, word) for word in warnings), 'reset_zone'], changes)
 
 
-def test_local_time(link, then):
-    """What happens to the local-time link; "tried" is a correction that ends in the reset.
+def test_local_time(link, then, *warnings):
+    """What happens to the local-time link.
 
-    link                                    then
+    link                                    then      warnings
     {ZONEINFO}/No/Zone                      kept
     {ZONEINFO}                              kept
     {ZONEINFO}X                             kept
-    /usr/share/zoneinfo/Asia/Tokyo          corrected
-    /usr/share/zoneinfo                     corrected
-    /usr/share/zoneinfo/                    corrected
-    /usr/share/zoneinfo/New/Zone            corrected
-    /usr/share/zoneinfo/Asia/Tokyo/Zone     tried
-    /usr/share/zoneinfo.default/Asia/Tokyo  tried
-    /usr/share/zoneinf                      reset
-    /var/db/timezone/zoneinf                reset
-    /x{ZONEINFO}/Asia/Tokyo                 reset
-    ../zoneinfo/Asia/Tokyo                  reset
-    zoneinfo/Asia/Tokyo                     reset
-    none                                    reset
-    directory                               reset
+    /usr/share/zoneinfo/Asia/Tokyo          corrected correcting
+    /usr/share/zoneinfo                     corrected correcting
+    /usr/share/zoneinfo/                    corrected correcting
+    /usr/share/zoneinfo/New/Zone            corrected correcting
+    /usr/share/zoneinfo/Asia/Tokyo/Zone     reset     correcting reset_zone
+    /usr/share/zoneinfo.default/Asia/Tokyo  reset     correcting reset_zone
+    /usr/share/zoneinf                      reset     reset_zone
+    /var/db/timezone/zoneinf                reset     reset_zone
+    /x{ZONEINFO}/Asia/Tokyo                 reset     reset_zone
+    ../zoneinfo/Asia/Tokyo                  reset     reset_zone
+    zoneinfo/Asia/Tokyo                     reset     reset_zone
+    none                                    reset     reset_zone
+    directory                               reset     no_link={LOCALTIME} reset_zone
     """
     lay_out(latest='2016g.1.0', localtime=link)
     put({f'{DATASETS}/2016g.1.0/zoneinfo/{zone}': 'file' for zone in ('Asia/Tokyo', 'New/Zone')})
     put({'/var/db/icu/entry': 'file'})  # so that it cannot be removed
     corrected = link.replace('/usr/share/zoneinfo', ZONEINFO, 1)
-    changes = {'kept': {}, 'corrected': {LOCALTIME: f'link {corrected}'}}.get(
-        then, {LOCALTIME: DEFAULT_ZONE})
-    start([f'no_link={LOCALTIME}'] * (link == 'directory')
-          + [f'correcting={corrected}'] * (then in ('corrected', 'tried'))
-          + ['reset_zone'] * (then in ('tried', 'reset')),
-          switched('2016f.1.0', '2016g.1.0') | changes)
+    changes = {'kept': {}, 'corrected': {LOCALTIME: f'link {corrected}'}, 'reset': RESET_ZONE}
+    start([word.replace('correcting', f'correcting={corrected}') for word in warnings],
+          switched('2016f.1.0', '2016g.1.0') | changes[then])
 
 
 def test_order_of_versions():
     ranks = '''x | 0a | 2014a | 2014a.0 2014a.00 | 2014a.1 | 2014a.1.0 | 2014a.1.9 | 2014a.2 |
         2014a.010 02014a.10 | 2014aa | 2014az.7 | 2014b | 2014z.9 | 2015a | 10000a | 2147483647a'''
     versions = [(rank, text) for rank, row in enumerate(ranks.split('|')) for text in row.split()]
-    for old, current in versions:
-        for new, latest in versions:
-            lay_out(current, latest, system='')  # whose version is older than all
-            refused = [f'unparsed={text}' for text in ('.1.0', current, latest) if text in '.1.0 x']
-            changes = switched(current, latest) | {MARKER: 'file'} if new > old else {}
-            start(refused + ['not_taken'] * (not changes), changes)
+    for (old, current), (new, latest) in itertools.product(versions, versions):
+        lay_out(current, latest, system='')  # whose version is older than all
+        refused = [f'unparsed={text}' for text in ('.1.0', current, latest) if text in '.1.0 x']
+        changes = switched(current, latest) | {MARKER: 'file'} if new > old else {}
+        start(refused + ['not_taken'] * (not changes), changes)
 
 
 def test_version_refused():
@@ -112,13 +107,12 @@ def test_version_refused():
 
 def test_version_of_the_system():
     many = 10**5
-    for what, word in (('file 2016f', '2016f'), ('file  \t\v\f\r\n2016f extra\n1a', '2016f'),
-                       (f'file 2016{many * "f"}\v', f'2016{many * "f"}'),
-                       (f'file {many * "0"}7a\f', f'{many * "0"}7a'),
-                       (f'file {many * "A"}', many * 'A'), ('file A.2\udcff', 'A.2\udcff'),
-                       ('file  \n\t', ''), ('directory', ''), (None, '')):
+    for what in ('file 2016f', 'file  \t\v\f\r\n2016f extra\n1a', f'file 2016{many * "f"}\v',
+                 f'file {many * "0"}7a\f', f'file {many * "A"}', 'file A.2\udcff', 'file  \n\t',
+                 'directory', None):
         lay_out(latest='2999a')
         put({f'{SYSTEM}/+VERSION': what})
+        word = ''.join((what or '').split()[1:2])
         start([f'unparsed={word}.1.0'] * (0 if word[:1].isdigit() else 2),
               switched(f'{word}.1.0', '2999a'))
     lay_out(system='2147483648a')
@@ -127,14 +121,13 @@ def test_version_of_the_system():
 
 def test_icu_format():
     data, taken = f'{DATASETS}/2016g.1.0/icutz', switched('2016f.1.0', '2016g.1.0')
-    cases = [(None, name, 'file', 0o644) for name in (  # none has a format, and nor has the system
-        '44L.dat 44x.dat l.dat 44.dat 44l.dat.bak 44l.DAT 44lxdat 4ldat :l.dat 4\udcb2l.dat '
-        '-4l.dat /l.dat /icutz44l.dat /../xicutz44l.dat').split()]
+    names = """44L.dat 44x.dat l.dat 44.dat 44l.dat.bak 44l.DAT 44lxdat 4ldat :l.dat 4\udcb2l.dat
+        -4l.dat /l.dat /icutz44l.dat /../xicutz44l.dat"""  # none has a format, and nor has the system
+    cases = [(None, name, 'file', 0o644) for name in names.split()]
     cases += [(None, '44l.dat', 'file', 0o770), (None, '44l.dat', 'link icutzformat.txt', 0o644),
-              (None, '44l.dat', 'directory', 0o755)]
-    cases += [(text, f'{text}.dat', 'file', 0o004) for text in ('44l', '2015b', '0e', '9l')]
+              (None, '44l.dat', 'directory', 0o755), ('junk', '44x.dat', 'file', 4)]
+    cases += [(text, f'{text}.dat', 'file', 4) for text in ('44l', '2015b', '0e', '9l')]
     cases += [(text, '44l.dat', 'file', 4) for text in ('44lx', '44L', '4l', '44')]
-    cases += [('junk', '44x.dat', 'file', 4)]
     for system, name, what, mode in cases:
         lay_out(latest='2016g.1.0')
         put({f'{SYSTEM_ICU}/icutzformat.txt': system and f'file \t{system}\nmore',
@@ -154,8 +147,7 @@ def test_link_cannot_be_made():
     put({ICU: 'directory'})
     icu = [f'remove: could not remove {ICU}: {error}', f'unlink of ICU softlink failed: {error}']
     start([*icu, f'create_symlink: from {ICU} to {DATASETS}/2016g.1.0/icutz: File exists',
-           'no_data: File exists', *icu, 'reset_zone'],
-          {ZONEINFO: f'link {SYSTEM}', LOCALTIME: DEFAULT_ZONE})
+           'no_data: File exists', *icu, 'reset_zone'], {ZONEINFO: f'link {SYSTEM}'} | RESET_ZONE)
     lay_out('directory')
     zoneinfo = [f'remove: could not remove {ZONEINFO}: {error}',
                 f'Unlink of zoneinfo softlink failed: {error}',
@@ -165,14 +157,10 @@ def test_link_cannot_be_made():
     lay_out(localtime='directory')
     put({f'{LOCALTIME}/entry': 'file', DATASETS: None})  # which no start makes
     start([f'no_link={LOCALTIME}', 'reset_zone: Invalid argument',
-           f'create_symlink: from {LOCALTIME} to {DEFAULT_ZONE[5:]}: File exists'], status=1)
-
-
-def test_directory_of_the_links_is_a_file():
+           f'create_symlink: from {LOCALTIME} to {DEFAULT_ZONE}: File exists'], status=1)
     lay_out()
     put({TZ: 'file'})
-    texts = ('read_symlink: ' + LATEST, 'no_data', 'remove: could not remove ' + ZONEINFO,
-             'Unlink of zoneinfo softlink failed', f'create_symlink: from {ZONEINFO} to {SYSTEM}')
+    texts = ['read_symlink: ' + LATEST, 'no_data', *(text.rpartition(': ')[0] for text in zoneinfo)]
     start([f'{text}: Not a directory' for text in texts], status=1)
 
 

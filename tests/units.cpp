@@ -5,7 +5,6 @@
 
 #include <cerrno>
 #include <cstdio>
-#include <cstdlib>
 #include <stdexcept>
 
 constexpr char expected[] = R"(
@@ -13,32 +12,27 @@ units: tz_icu::initialize: fts_open of /icutz failed, File name too long: File n
 error 36
 units: mira_icu::compatible_schema: could not dynamic_cast other component: Success
 compatible: 0, 1
-1b.2.3
+out of range: 2014c.1.-1
 units: Cannot parse version string 2014, results.size() = 0: Success
 units: Cannot parse version string 2014: Success
 -1.-1.-1
-out of range: 2014c.1.-1
-out of range: 2015d.1.-1
 )";
 
 int main() {
-    char* text = nullptr;
-    std::size_t size = 0;
-    stderr = ::open_memstream(&text, &size); // where the warnings go
-    std::fputs("\n", stderr);
+    static char text[1 << 18] = "\n";
+    stderr = ::fmemopen(text, sizeof text, "a"); // where the warnings go
     try {
         const mira_icu data(std::string(70'000, 'x')); // longer than a walk can hold
     } catch (const int error) {
         std::fprintf(stderr, "error %d\n", error);
     }
-    const mira_icu icu_data("nowhere");
-    const mira_zoneinfo zoneinfo_data("nowhere");
+    const mira_icu icu("nowhere");
+    const mira_zoneinfo zoneinfo("nowhere");
     errno = 0;
-    const bool icu_fits = icu_data.compatible_schema(zoneinfo_data);
-    const bool zoneinfo_fits = zoneinfo_data.compatible_schema(icu_data);
-    std::fprintf(stderr, "compatible: %d, %d\n", icu_fits, zoneinfo_fits);
+    const bool fits = icu.compatible_schema(zoneinfo);
+    std::fprintf(stderr, "compatible: %d, %d\n", fits, zoneinfo.compatible_schema(icu));
     mira_version version;
-    for (const char* const parsed : {"1b.2.3", "2014", "2014c.1.2147483648", "2015d.99999999999"}) {
+    for (const char* const parsed : {"2014c.1.2147483648", "2014"}) {
         try {
             version.parse(parsed);
         } catch (const std::out_of_range&) {
@@ -49,8 +43,7 @@ int main() {
     }
     std::fclose(stderr);
     std::string seen = text;
-    std::free(text);
     std::erase(seen, 'x');
     std::fputs(seen == expected ? "passed\n" : seen.c_str(), stdout);
-    return seen == expected ? 0 : 1;
+    return seen != expected;
 }
