@@ -72,11 +72,11 @@ def snapshot():
         directories[:] = {*directories} - {'proc'}
         for path in {os.path.join(parent, name) for name in directories + files} - harness:
             status = os.lstat(path)
-            mode, content, mark = stat.filemode(status.st_mode), '', ''
-            if mode[0] != 'd':
-                content = os.readlink(path) if mode[0] == 'l' else pathlib.Path(path).read_bytes()
-                mark = '*' * (int(status.st_mtime) not in OLD)
-            what = KINDS.get(mode, mode), os.fsdecode(content), mark
+            mode, changed = stat.filemode(status.st_mode), int(status.st_mtime) not in OLD
+            content = os.readlink(path) if mode[0] == 'l' else ''
+            if mode[0] == '-':
+                content = os.fsdecode(pathlib.Path(path).read_bytes())
+            what = KINDS.get(mode, mode), content, '*' * (changed and mode[0] != 'd')
             seen[path] = ' '.join(filter(None, what))
     return seen
 
@@ -93,12 +93,12 @@ def switched(current, latest):
     return data_links(latest) | {RECORD: f'file {current}_{latest}'}
 
 
-def lay_out(current='system', latest='none', localtime=f'{ZONEINFO}/Asia/Tokyo', system='2016f'):
+def lay_out(current='system', latest='none', localtime=f'{ZONEINFO}/Asia/Tokyo', besides={}):
     """Makes the device anew, with files in each dataset that would count in the other kind only. A
     link has a text that begins with a slash, a dot or `tz/`, is one of WORDS, or leads to the
     update of a version, which is then installed; that of 2017 has another ICU format."""
     put({'/usr/share': None, '/var': None, DATASETS: 'directory', ICU: 'link ./stale',
-         f'{SYSTEM}/+VERSION': f'file {system}\n', f'{SYSTEM}/Asia/Tokyo': 'file',
+         f'{SYSTEM}/+VERSION': 'file 2016f\n', f'{SYSTEM}/Asia/Tokyo': 'file',
          f'{SYSTEM_ICU}/icutzformat.txt': 'file 44l\n', f'{SYSTEM_ICU}/icutz77e.dat': 'file'})
     for path, text in (ZONEINFO, current), (LATEST, latest), (LOCALTIME, localtime):
         if text in WORDS or text.startswith(('/', '.', 'tz/')) or path == LOCALTIME:
@@ -108,6 +108,7 @@ def lay_out(current='system', latest='none', localtime=f'{ZONEINFO}/Asia/Tokyo',
             put({f'{update}/zoneinfo/+VERSION': 'file 1999z', f'{update}/icutz/icutzformat.txt':
                  'file 77e', f'{update}/icutz/icutz{icu_format}.dat': 'file'})
             put(data_links(text) if path == ZONEINFO else {path: f'link {update}'})
+    put(besides)
 
 
 def lay_out_busy():
@@ -122,7 +123,7 @@ def run(*before, prepare=None):
     process = subprocess.run([*before, *command], env=ENVIRONMENT, preexec_fn=prepare, timeout=20,
                              stdin=subprocess.DEVNULL, capture_output=True)
     if b'PTRACE' in process.stderr:
-        sys.exit('system calls cannot be traced here: ' + os.fsdecode(process.stderr).split('\n')[0])
+        sys.exit(f'system calls cannot be traced here: {process.stderr.splitlines()[0]}')
     return process
 
 
@@ -157,32 +158,34 @@ def compare(expected, seen):
 
 def main(*tools):
     """Runs, in a device beside PROGRAM, the functions of a script named test_..., once or with each
-    row of the table in their text, as far as name and row have every WORD; prints their titles."""
+    row of the table in their text, as far as name and row have every WORD. Prints these before. A
+    program behind an emulator and a semicolon cannot be traced."""
     *emulator, program = sys.argv[1].split(';')
     command[:0] = [f'/{os.path.basename(path)}' for path in emulator]
-    script = vars(sys.modules['__main__'])
+    tests = [function for name, function in vars(sys.modules['__main__']).items()
+             if name.startswith('test_') and not (emulator and 'traced' in name)]
 
     def run_tests():
         passed = 0
-        for name in [name for name in script if name.startswith('test_')]:
-            text, _, table = (script[name].__doc__ or '').partition('\n\n')
-            first = script[name].__code__.co_firstlineno + (text.count('\n') + 4 if table else 0)
+        for test in tests:
+            text, _, table = (test.__doc__ or '').partition('\n\n')
+            first = test.__code__.co_firstlineno + (text.count('\n') + 4 if table else 0)
             for line, row in enumerate(table.splitlines()[1:-1] or [''], first):
-                if all(word in f'{name} {row}' for word in sys.argv[2:]):
-                    print(f'{sys.argv[0]}:{line}: {name} {row.strip()}', flush=True)
-                    script[name](*row.partition('#')[0].format(**globals()).split())
+                title = f'{test.__name__} {row.strip()}'
+                if all(word in title for word in sys.argv[2:]):
+                    print(f'{sys.argv[0]}:{line}: {title}', flush=True)
+                    test(*row.partition('#')[0].format(**globals()).split())
                     passed += 1
         print(f'{passed} passed')
         return passed
 
-    place = f'{os.path.dirname(program)}/device.{os.path.basename(sys.argv[0])}'
-    in_device(run_tests, program, place.removesuffix('.py'), [*emulator, *tools])
+    in_device(run_tests, program, f'{os.path.dirname(program)}/device', [*emulator, *tools])
 
 
 def in_device(action, program, place, tools=(), keep=False):
     """Makes the directory `place` a device with the program and the tools, calls `action` in it and
-    ends this process, with 0 when that returned true. Keeps the device when it did not or if asked.
-    Another user becomes root for that, in a user namespace or by sudo."""
+    ends this process, with 0 when that returned true. The device is kept when it did not, or on
+    demand. Another user becomes root first, in a user namespace or by sudo."""
     become_root()
     copies = {'/dev/null': '/dev/null', '/mira_tzlinks': program}
     copies |= {f'/{os.path.basename(tool)}': tool for tool in tools}
