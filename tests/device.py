@@ -1,4 +1,4 @@
-"""The words to lay out a device, start it, and compare what happened with what should. A device is a
+"""The words to lay out a device, start it, and compare what happens with what should. A device is a
 directory with the program in it, which a process of ours enters by chroot: paths are the system's
 own there, and nothing that a test does can reach what lies outside."""
 
@@ -14,9 +14,10 @@ import stat
 import subprocess
 import sys
 
-TZ, SYSTEM, SYSTEM_ICU = '/var/db/timezone', '/usr/share/zoneinfo.default', '/usr/share/icu'
+TZ, TREE, SYSTEM_ICU = '/var/db/timezone', '/usr/share/zoneinfo', '/usr/share/icu'
 DATASETS, LATEST, ZONEINFO, ICU = f'{TZ}/tz', f'{TZ}/tz_latest', f'{TZ}/zoneinfo', '/var/db/icutz'
-LOCALTIME, DEFAULT_ZONE = f'{TZ}/localtime', f'{ZONEINFO}/America/Los_Angeles'
+SYSTEM, LOCALTIME = f'{TREE}.default', f'{TZ}/localtime'
+DEFAULT_ZONE = f'{ZONEINFO}/America/Los_Angeles'
 MARKER, RECORD = f'{TZ}/needs_cleanup', f'{TZ}/TZVersionDiffRecord'
 LONG = '/' + 1023 * 'x'  # as much as is read of a link
 RESET_ZONE = {LOCALTIME: f'link {DEFAULT_ZONE}'}

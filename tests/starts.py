@@ -8,7 +8,7 @@ import re
 import resource
 
 from device import (DATASETS, DEFAULT_ZONE, ICU, LATEST, LOCALTIME, MARKER, RECORD, RESET_ZONE,
-                    SYSTEM, SYSTEM_ICU, TZ, WORDS, ZONEINFO, compare, data_links, lay_out,
+                    SYSTEM, SYSTEM_ICU, TZ, TREE, WORDS, ZONEINFO, compare, data_links, lay_out,
                     lay_out_busy, main, put, run, snapshot, start, switched)
 
 STRACE = ['/strace', '-qq', '-o', '/trace']
@@ -67,34 +67,26 @@ def test_dataset(current, latest, then, marker, record, *warnings):
     start([*(texts.get(word, word) for word in warnings), 'reset_zone'], changes)
 
 
-def test_local_time(link, then, *warnings):
-    """What happens to the local-time link.
+def test_local_time(then, warnings, *links):
+    """What happens to a local-time link of each text.
 
-    link                                    then      warnings
-    {ZONEINFO}/No/Zone                      kept
-    {ZONEINFO}                              kept
-    {ZONEINFO}X                             kept
-    /usr/share/zoneinfo/Asia/Tokyo          corrected correcting
-    /usr/share/zoneinfo                     corrected correcting
-    /usr/share/zoneinfo/                    corrected correcting
-    /usr/share/zoneinfo/New/Zone            corrected correcting
-    /usr/share/zoneinfo/Asia/Tokyo/Zone     reset     correcting reset_zone
-    /usr/share/zoneinfo.default/Asia/Tokyo  reset     correcting reset_zone
-    /usr/share/zoneinf                      reset     reset_zone
-    /var/db/timezone/zoneinf                reset     reset_zone
-    /x{ZONEINFO}/Asia/Tokyo                 reset     reset_zone
-    ../zoneinfo/Asia/Tokyo                  reset     reset_zone
-    zoneinfo/Asia/Tokyo                     reset     reset_zone
-    none                                    reset     reset_zone
-    directory                               reset     no_link={LOCALTIME} reset_zone
+    then      warnings              links
+    kept      -                     {ZONEINFO}/No/Zone {ZONEINFO} {ZONEINFO}X {ZONEINFO}/../x
+    corrected correcting            {TREE}/Asia/Tokyo {TREE}//Asia/Tokyo {TREE}/New {TREE}/ {TREE}
+    reset     correcting,reset_zone {TREE}.default/Asia/Tokyo {TREE}/posix/Asia/Tokyo {TREE}/New/
+    reset     reset_zone            none zoneinfo/Asia/Tokyo ../zoneinfo/Asia/Tokyo {TZ}/zoneinf
+    reset     reset_zone            /usr/share/zoneinfX/New /x{TREE}/Asia/Tokyo /x{ZONEINFO}/x
+    reset     reset_zone            {DATASETS}/2016g.1.0/zoneinfo/Asia/Tokyo /..{SYSTEM}/Asia/Tokyo
+    reset     no_link={LOCALTIME},reset_zone directory
     """
     update = f'{DATASETS}/2016g.1.0/zoneinfo'
-    lay_out('system', '2016g.1.0', link, {
-        f'{update}/Asia/Tokyo': 'file', f'{update}/New/Zone': 'file', '/var/db/icu/entry': 'file'})
-    corrected = link.replace('/usr/share/zoneinfo', ZONEINFO, 1)
-    changes = {'kept': {}, 'corrected': {LOCALTIME: f'link {corrected}'}, 'reset': RESET_ZONE}
-    start([word.replace('correcting', f'correcting={corrected}') for word in warnings],
-          switched('2016f.1.0', '2016g.1.0') | changes[then])
+    for link in links:
+        lay_out('system', '2016g.1.0', link, {f'{update}/Asia/Tokyo': 'file', '/var/db/icu/entry':
+                                              'file', f'{update}/New': 'file'})
+        corrected = link.replace(TREE, ZONEINFO, 1)
+        changes = {'kept': {}, 'corrected': {LOCALTIME: f'link {corrected}'}, 'reset': RESET_ZONE}
+        start([word.replace('correcting', f'correcting={corrected}') for word in warnings.split(',')
+               if word != '-'], switched('2016f.1.0', '2016g.1.0') | changes[then])
 
 
 def test_order_of_versions():
@@ -133,7 +125,7 @@ def test_version_of_the_system():
 def test_icu_format():
     data, taken = f'{DATASETS}/2016g.1.0/icutz', switched('2016f.1.0', '2016g.1.0')
     names = """44L.dat 44x.dat l.dat 44.dat 44l.dat.bak 44l.DAT 44lxdat 4ldat :l.dat 4\udcb2l.dat
-        -4l.dat /l.dat /icutz44l.dat /../xicutz44l.dat"""  # none has a format, and nor has the system
+        -4l.dat /l.dat /icutz44l.dat /../xicutz44l.dat"""  # none has a format
     cases = [(None, name, 'file', 0o644) for name in names.split()]
     cases += [(None, '44l.dat', 'file', 0o770), (None, '44l.dat', 'link icutzformat.txt', 0o644),
               (None, '44l.dat', 'directory', 0o755), ('junk', '44x.dat', 'file', 4)]
