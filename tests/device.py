@@ -55,14 +55,12 @@ def put(tree):
         shutil.rmtree(path, ignore_errors=True)
         if os.path.lexists(path):
             os.remove(path)
-        os.makedirs(os.path.dirname(path), exist_ok=True)
         kind, _, content = (what or '').partition(' ')
+        os.makedirs(path if kind == 'directory' else os.path.dirname(path), exist_ok=True)
         if kind == 'file':
             pathlib.Path(path).write_bytes(os.fsencode(content))
         elif kind == 'link':
             os.symlink(content, path)
-        elif kind:
-            os.mkdir(path)
 
 
 def snapshot():
@@ -95,9 +93,9 @@ def switched(current, latest):
 
 
 def lay_out(current='system', latest='none', localtime=f'{ZONEINFO}/Asia/Tokyo', besides={}):
-    """Makes the device anew, with files in each dataset that would count in the other kind only. A
-    link has a text that begins with a slash, a dot or `tz/`, is one of WORDS, or leads to the
-    update of a version, which is then installed; that of 2017 has another ICU format."""
+    """Makes the device anew. A link has a text that begins with a slash, a dot or `tz/`, is one of
+    WORDS, or leads to the update of a version, which is then installed. The system and an update
+    have files besides that would count in the other; updates of 2017 have another ICU format."""
     put({'/usr/share': None, '/var': None, DATASETS: 'directory', ICU: 'link ./stale',
          f'{SYSTEM}/+VERSION': 'file 2016f\n', f'{SYSTEM}/Asia/Tokyo': 'file',
          f'{SYSTEM_ICU}/icutzformat.txt': 'file 44l\n', f'{SYSTEM_ICU}/icutz77e.dat': 'file'})
@@ -159,9 +157,8 @@ def compare(expected, seen):
 
 def main(*tools):
     """Runs, in a device beside PROGRAM, the functions of a script named test_..., once or with each
-    row of the table in their text, as far as name and row have every WORD. Prints these before. A
-    program behind an emulator and a semicolon cannot be traced."""
-    *emulator, program = sys.argv[1].split(';')
+    row of the table in their text, if name and row have every WORD. Prints those two before."""
+    *emulator, program = sys.argv[1].split(';')  # behind an emulator, calls cannot be traced
     command[:0] = [f'/{os.path.basename(path)}' for path in emulator]
     tests = [function for name, function in vars(sys.modules['__main__']).items()
              if name.startswith('test_') and not (emulator and 'traced' in name)]

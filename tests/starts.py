@@ -3,7 +3,6 @@
 
 import itertools
 import os
-import pathlib
 import re
 import resource
 
@@ -79,10 +78,9 @@ def test_local_time(then, warnings, *links):
     reset     reset_zone            {DATASETS}/2016g.1.0/zoneinfo/Asia/Tokyo /..{SYSTEM}/Asia/Tokyo
     reset     no_link={LOCALTIME},reset_zone directory
     """
-    update = f'{DATASETS}/2016g.1.0/zoneinfo'
+    zones = {f'{DATASETS}/2016g.1.0/zoneinfo/{zone}': 'file' for zone in ('Asia/Tokyo', 'New')}
     for link in links:
-        lay_out('system', '2016g.1.0', link, {f'{update}/Asia/Tokyo': 'file', '/var/db/icu/entry':
-                                              'file', f'{update}/New': 'file'})
+        lay_out('system', '2016g.1.0', link, zones | {'/var/db/icu/entry': 'file'})
         corrected = link.replace(TREE, ZONEINFO, 1)
         changes = {'kept': {}, 'corrected': {LOCALTIME: f'link {corrected}'}, 'reset': RESET_ZONE}
         start([word.replace('correcting', f'correcting={corrected}') for word in warnings.split(',')
@@ -138,8 +136,8 @@ def test_icu_format():
         os.chmod(f'{data}/icutz{name}', mode)
         same = system in (None, name[:-4])
         start([] if same else ['not_taken'], taken if same else {})
-    put({f'{DATASETS}/icu/icutz{text}.dat': 'file' for text in ('44l', '45b', '46e', '47l')})
-    put({data: 'link ../icu'})
+    put({f'{DATASETS}/icu/icutz{text}.dat': 'file' for text in ('44l', '45b', '46e', '47l')}
+        | {data: 'link ../icu'})
     put({f'{SYSTEM_ICU}/icutzformat.txt': f'file {os.listdir(data)[0][5:8]}'})  # that of the first
     start((), taken)
 
@@ -181,7 +179,7 @@ def test_odd_surroundings():
 def trace():
     """Returns the calls of a start, from the first on the device on: the name of each, its number
     among those of the name, and its line."""
-    lines = pathlib.Path('/trace').read_text().splitlines()
+    lines = open('/trace').read().splitlines()
     names = [line.partition('(')[0] for line in lines]
     calls = [(name, names[:at + 1].count(name), lines[at]) for at, name in enumerate(names)]
     return [*itertools.dropwhile(lambda call: f'"{TZ}/"' not in call[2], calls)]
