@@ -39,7 +39,7 @@ ERROR = re.compile(': [A-Z][^:]*$')  # the text of an errno, with which each of 
 # No start heeds these. AddressSanitizer does, which cannot look for leaks under a tracer.
 VARIABLES = 'DEBUG DESTDIR HOME ICU_DATA ICU_TIMEZONE_FILES_DIR LANG LC_ALL PATH ROOT TZ TZDIR'
 ENVIRONMENT = dict.fromkeys(VARIABLES.split(), '/elsewhere') | {'ASAN_OPTIONS': 'detect_leaks=0'}
-command = ['/mira_tzlinks', '-n', '--version', '/elsewhere']
+command, arguments = ['/mira_tzlinks'], ['-n', '--version', '/elsewhere', '-h', '--help']
 
 WORDS = {'system': f'link {SYSTEM}', 'file': 'file', 'directory': 'directory', 'none': None}
 KINDS = {'-rw-r--r--': 'file', 'drwxr-xr-x': 'directory', 'lrwxrwxrwx': 'link'}
@@ -119,8 +119,9 @@ def lay_out_busy():
 
 def run(*before, prepare=None):
     """Runs the program to its end, behind a command and after a call of `prepare`, if any."""
-    process = subprocess.run([*before, *command], env=ENVIRONMENT, preexec_fn=prepare, timeout=20,
-                             stdin=subprocess.DEVNULL, capture_output=True)
+    arguments.append(arguments.pop(0))  # another first one at each start
+    process = subprocess.run([*before, *command, *arguments], env=ENVIRONMENT, preexec_fn=prepare,
+                             stdin=subprocess.DEVNULL, capture_output=True, timeout=20)
     if b'PTRACE' in process.stderr:
         sys.exit(f'system calls cannot be traced here: {process.stderr.splitlines()[0]}')
     return process

@@ -125,9 +125,9 @@ def test_icu_format():
     names = """44L.dat 44x.dat l.dat 44.dat 44l.dat.bak 44l.DAT 44lxdat 4ldat :l.dat 4\udcb2l.dat
         -4l.dat /l.dat /icutz44l.dat /../xicutz44l.dat"""  # none has a format
     cases = [(None, name, 'file', 0o644) for name in names.split()]
-    cases += [(None, '44l.dat', 'file', 0o770), (None, '44l.dat', 'link icutzformat.txt', 0o644),
+    cases += [(None, '44l.dat', 'file', 0o773), (None, '44l.dat', 'link icutzformat.txt', 0o644),
               (None, '44l.dat', 'directory', 0o755), ('junk', '44x.dat', 'file', 4)]
-    cases += [(text, f'{text}.dat', 'file', 4) for text in ('44l', '2015b', '0e', '9l')]
+    cases += [(text, f'{text}.dat', 'file', 4) for text in ('44l', '2015b', '044l', '9e')]
     cases += [(text, '44l.dat', 'file', 4) for text in ('44lx', '44L', '4l', '44')]
     for system, name, what, mode in cases:
         lay_out(latest='2016g.1.0', besides={
