@@ -91,9 +91,6 @@ the last colon is the last error of any system call: here it means nothing.)''')
         device.put({f'/{name}': None})
     for path in device.snapshot():
         os.utime(path, follow_symlinks=False)
-    chroot = 'sudo chroot ' if 'SUDO_UID' in os.environ else 'chroot '
-    if os.stat('/').st_uid:  # root of a user's own namespace does not own it
-        chroot = 'unshare --map-root-user --root='
     print(f'''
 Look at the device, change something, and play the next start by hand, from the project's directory:
     ls -l {PLACE}/var/db/timezone
@@ -109,4 +106,7 @@ year = int(first[:4]) + 1
 dataset = f'{DATASETS}/{year}a.1.0'
 # The zone's last line ends with 2024; another follows.
 invented = re.sub(r'(?m)^Z America/Los_Angeles .*(\n-?\d.*)*', r'\g<0> 2025\n-7 - PDT', source, 1)
+chroot = 'sudo chroot ' if 'SUDO_UID' in os.environ else 'chroot '
+if os.stat('/').st_uid:  # the machine's, which root of a user's own namespace does not own
+    chroot = 'unshare --map-root-user --root='
 device.in_device(story, 'build/release/mira_tzlinks', PLACE, ['zic'], keep=True)
