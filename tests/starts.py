@@ -127,8 +127,8 @@ def test_icu_format():
     cases = [(None, name, 'file', 0o644) for name in names.split()]
     cases += [(None, '44l.dat', 'file', 0o773), (None, '44l.dat', 'link icutzformat.txt', 0o644),
               (None, '44l.dat', 'directory', 0o755), ('junk', '44x.dat', 'file', 4)]
-    cases += [(text, f'{text}.dat', 'file', 4) for text in ('44l', '2015b', '044l', '9e')]
-    cases += [(text, '44l.dat', 'file', 4) for text in ('44lx', '44L', '4l', '44')]
+    cases += [(text, f'{text}.dat', 'file', 4) for text in ('44l', '044l', '9e', 17 * '2' + 'b')]
+    cases += [(text, '44l.dat', 'file', 4) for text in ('', '44lx', '44L', '4l', '44')]
     for system, name, what, mode in cases:
         lay_out(latest='2016g.1.0', besides={
             f'{SYSTEM_ICU}/icutzformat.txt': system and f'file \t{system}\nmore',
