@@ -196,7 +196,7 @@ def in_device(action, program, place, tools=(), keep=False):
     signal.pthread_sigmask(signal.SIG_BLOCK, signals)
     libc.prctl(1, signal.SIGTERM)  # for when our own parent has ended
     os.umask(0o022)
-    fcntl.flock(os.open(sys.argv[0], os.O_RDONLY), fcntl.LOCK_EX)  # after another run
+    fcntl.flock(os.open(__file__, os.O_RDONLY), fcntl.LOCK_EX)  # after another run
     remove(place)
     for name, path in copies.items():
         os.makedirs(os.path.dirname(place + name), exist_ok=True)
