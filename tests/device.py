@@ -19,7 +19,6 @@ DATASETS, LATEST, ZONEINFO, ICU = f'{TZ}/tz', f'{TZ}/tz_latest', f'{TZ}/zoneinfo
 SYSTEM, LOCALTIME = f'{TREE}.default', f'{TZ}/localtime'
 DEFAULT_ZONE = f'{ZONEINFO}/America/Los_Angeles'
 MARKER, RECORD = f'{TZ}/needs_cleanup', f'{TZ}/TZVersionDiffRecord'
-LONG = '/' + 1023 * 'x'  # as much as is read of a link
 RESET_ZONE = {LOCALTIME: f'link {DEFAULT_ZONE}'}
 
 # The words for warnings. What follows a word and `=` takes the place of the braces.
@@ -41,7 +40,8 @@ VARIABLES = 'DEBUG DESTDIR HOME ICU_DATA ICU_TIMEZONE_FILES_DIR LANG LC_ALL PATH
 ENVIRONMENT = dict.fromkeys(VARIABLES.split(), '/elsewhere') | {'ASAN_OPTIONS': 'detect_leaks=0'}
 command, arguments = ['/mira_tzlinks'], ['-n', '--version', '/elsewhere', '-h', '--help']
 
-WORDS = {'system': f'link {SYSTEM}', 'file': 'file', 'directory': 'directory', 'none': None}
+WORDS = {'system': f'link {SYSTEM}', 'file': f'file {DATASETS}/2016g.1.0/x',
+         'directory': 'directory', 'none': None}
 KINDS = {'-rw-r--r--': 'file', 'drwxr-xr-x': 'directory', 'lrwxrwxrwx': 'link'}
 OLD = 2208988800, 2**31 - 1  # 2040, and what that is on a file system whose dates end before
 harness = set()  # what a device holds for our sake, by path
@@ -97,8 +97,9 @@ def lay_out(current='system', latest='none', localtime=f'{ZONEINFO}/Asia/Tokyo',
     WORDS, or leads to the update of a version, which is then installed. The system and an update
     have files besides that would count in the other; updates of 2017 have another ICU format."""
     put({'/usr/share': None, '/var': None, DATASETS: 'directory', ICU: 'link ./stale',
-         f'{SYSTEM}/+VERSION': 'file 2016f\n', f'{SYSTEM}/Asia/Tokyo': 'file',
-         f'{SYSTEM_ICU}/icutzformat.txt': 'file 44l\n', f'{SYSTEM_ICU}/icutz77e.dat': 'file'})
+         f'{SYSTEM}/+VERSION': 'file 2016f\n', f'{SYSTEM}/VERSION': 'file 1a',
+         f'{SYSTEM}/Asia/Tokyo': 'file', f'{SYSTEM_ICU}/icutz77e.dat': 'file',
+         f'{SYSTEM_ICU}/icutzformat.txt': 'file 44l\n'})
     for path, text in (ZONEINFO, current), (LATEST, latest), (LOCALTIME, localtime):
         if text in WORDS or text.startswith(('/', '.', 'tz/')) or path == LOCALTIME:
             put({path: WORDS.get(text, f'link {text}')})

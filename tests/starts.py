@@ -7,13 +7,14 @@ import re
 import resource
 
 from device import (DATASETS, DEFAULT_ZONE, ICU, LATEST, LOCALTIME, MARKER, RECORD, RESET_ZONE,
-                    SYSTEM, SYSTEM_ICU, TZ, TREE, WORDS, ZONEINFO, compare, data_links, lay_out,
+                    SYSTEM, SYSTEM_ICU, TZ, TREE, ZONEINFO, compare, data_links, lay_out,
                     lay_out_busy, main, put, run, snapshot, start, switched)
 
 STRACE = ['/strace', '-qq', '-o', '/trace']
 CALL = re.compile(
     r'^\w*?(open|unlink|symlink|readlink|access|rename|rmdir|mkdir|chmod)\w*\((?:AT_FDCWD, )?'
-    r'"(/[^"]*)"(?:, ((?:\|?[OF]_(?!NONB)[A-Z]+)+))?|^(fcntl).*, (0x\d+)|^(write)\(2', re.MULTILINE)
+    r'"(/[^"]*)"(?:, ((?:\|?[OF]_(?!NONB)[A-Z]+)+))?'
+    r'|^(fcntl).* 0x40.*, (0x\d+)|^(write)\(2', re.MULTILINE)
 FILES = {ZONEINFO: 'zoneinfo', ICU: 'icu', LOCALTIME: 'local', MARKER: 'marker', RECORD: 'record'}
 READ_SYSTEM = f'open {SYSTEM}/+VERSION O_RDONLY, open /usr/share/icu/icutzformat.txt O_RDONLY,'
 BEGIN = f'''open {TZ}/ O_RDONLY|O_CLOEXEC, fcntl 0x4, open {TZ}/tz/ O_RDONLY|O_CLOEXEC,
@@ -37,33 +38,36 @@ def test_dataset(current, latest, then, marker, record, *warnings):
     2016d.1.0      2016e.1.0    2016e.1.0 file   2016f.1.0_2016e.1.0 incompatible
     2017a.1.0      2016h.1.0    system    file   -                   incompatible not_taken
     2017a.1.0      2017b.1.0    system    file   -                   incompatible not_taken
-    system         2016g.1.0/   system    none   -                   unparsed=2016g.1.0/ not_taken
+    system         2016g.1.0/   system    none   -                   unparsed not_taken
+    system         1a/zoneinfo  system    none   -                   unparsed not_taken
     2147483648a    none         system    none   -                   no_data
     2016g.1.0      2147483648a  system    none   -                   no_data
-    2016g.1.0      {LONG}cut    system    none   -                   bad_path={LONG} no_data
-    2016g.1.0      {TZ}/tz/     system    none   -                   bad_path no_data
-    2016g.1.0      {TZ}/tzx/1a  system    none   -                   bad_path no_data
     2016e.1.0      /x{TZ}/tz/1a system    file   -                   incompatible bad_path no_data
-    2016g.1.0      tz/2016h.1.0 system    none   -                   bad_path no_data
     2016g.1.0      file         system    none   -                   no_link={LATEST} no_data
     file           none         system    none   -                   no_link={ZONEINFO} bad_links
     none           none         system    none   -                   no_zoneinfo bad_links
-    {SYSTEM}/      none         system    none   -                   bad_link bad_links
-    tz/2016g.1.0/x none         system    none   -                   bad_link bad_links
-    {TZ}/tz/1a     none         system    none   -                   bad_link bad_links
-    {TZ}/tz//x     none         system    none   -                   bad_link bad_links
-    {TZ}/tzx/1a/x  none         system    none   -                   bad_link bad_links
     /x{TZ}/tz/1a/x 2016g.1.0    2016g.1.0 none   2016f.1.0_2016g.1.0 bad_link bad_links
     {TZ}/tz/x/     none         system    file   -                   unparsed=x incompatible
+    {TZ}/tz/1a//b  none         system    file   -                   unparsed=1a/ incompatible
     {TZ}/tz/1a/b/c none         system    file   -                   unparsed=1a/b incompatible
     """
     lay_out(current, latest, './nowhere', {
         MARKER: 'directory', RECORD: 'file of an earlier switch', '/var/db/icu': 'directory'})
-    changes = RESET_ZONE | {MARKER: WORDS[marker], '/var/db/icu': None}
+    changes = RESET_ZONE | {MARKER: None if marker == 'none' else 'file', '/var/db/icu': None}
     changes |= data_links(then) if then != current else {}
     changes |= {RECORD: f'file {record}'} if record != '-' else {}
-    texts = {'bad_link': f'bad_link={current}', 'bad_path': f'bad_path={latest}'}
-    start([*(texts.get(word, word) for word in warnings), 'reset_zone'], changes)
+    texts = {'bad_link': current, 'bad_path': latest, 'unparsed': latest}
+    warnings = [f'{word}={texts[word]}' if word in texts else word for word in warnings]
+    start([*warnings, 'reset_zone'], changes)
+
+
+def test_link_names_no_dataset():
+    for text in (f'{SYSTEM}/', TREE, f'{TZ}/tz/1a', f'{TZ}/tz//x', f'{TZ}/tzx/1a/x', 'tz/1a/x'):
+        lay_out(text)
+        start([f'bad_link={text}', 'bad_links'], data_links('system'))
+    for text in f'{TZ}/tz/', f'{TZ}/tzx/1a', 'tz/2016h.1.0', SYSTEM, f'/{2000 * "x"}':
+        lay_out('2016g.1.0', text)
+        start([f'bad_path={text[:1024]}', 'no_data'], data_links('system'))
 
 
 def test_local_time(then, warnings, *links):
@@ -72,15 +76,17 @@ def test_local_time(then, warnings, *links):
     then      warnings              links
     kept      -                     {ZONEINFO}/No/Zone {ZONEINFO} {ZONEINFO}X {ZONEINFO}/../x
     corrected correcting            {TREE}/Asia/Tokyo {TREE}//Asia/Tokyo {TREE}/New {TREE}/ {TREE}
-    reset     correcting,reset_zone {TREE}.default/Asia/Tokyo {TREE}/posix/Asia/Tokyo {TREE}/New/
+    reset     correcting,reset_zone {TREE}.default/New {TREE}/posix/New {TREE}/New/ {TREE}/Gone
     reset     reset_zone            none zoneinfo/Asia/Tokyo ../zoneinfo/Asia/Tokyo {TZ}/zoneinf
     reset     reset_zone            /usr/share/zoneinfX/New /x{TREE}/Asia/Tokyo /x{ZONEINFO}/x
     reset     reset_zone            {DATASETS}/2016g.1.0/zoneinfo/Asia/Tokyo /..{SYSTEM}/Asia/Tokyo
     reset     no_link={LOCALTIME},reset_zone directory
     """
-    zones = {f'{DATASETS}/2016g.1.0/zoneinfo/{zone}': 'file' for zone in ('Asia/Tokyo', 'New')}
+    tree = f'{DATASETS}/2016g.1.0/zoneinfo'
     for link in links:
-        lay_out('system', '2016g.1.0', link, zones | {'/var/db/icu/entry': 'file'})
+        lay_out('system', '2016g.1.0', link, {
+            f'{tree}/Asia/Tokyo': 'file', f'{tree}/New': 'file', f'{tree}/Gone': 'link nowhere',
+            '/var/db/icu/entry': 'file'})
         corrected = link.replace(TREE, ZONEINFO, 1)
         changes = {'kept': {}, 'corrected': {LOCALTIME: f'link {corrected}'}, 'reset': RESET_ZONE}
         start([word.replace('correcting', f'correcting={corrected}') for word in warnings.split(',')
