@@ -94,7 +94,7 @@ def test_local_time(then, warnings, *links):
 
 
 def test_order_of_versions():
-    ranks = '''x | 0a | 2014a | 2014a.0 2014a.00 | 2014a.1 | 2014a.1.0 | 2014a.1.9 | 2014a.2 |
+    ranks = '''x | 0a | 2014a | 2014a.0 2014a.00 | 2014a.1 | 2014a.1.0 | 2014a.1.9 | 2014a.9 |
         2014a.010 02014a.10 | 2014aa | 2014az.7 | 2014b | 2014z.9 | 2015a | 10000a | 2147483647a'''
     versions = [(rank, text) for rank, row in enumerate(ranks.split('|')) for text in row.split()]
     for (old, current), (new, latest) in itertools.product(versions, versions):
