@@ -78,11 +78,12 @@ the last colon is the last error of any system call: here it means nothing.)''')
           ['incompatible', 'not_taken'], device.data_links('system') | {MARKER: 'file'})
 
     device.put({LATEST: None, dataset: None, LOCALTIME: 'link /usr/share/zoneinfo/Asia/Tokyo'})
-    start('5. The old update was cleaned up, and local time was linked past the zoneinfo link.',
+    start('5. Another program cleaned up the update, and linked local time past the zoneinfo link.',
           [f'correcting={ZONEINFO}/Asia/Tokyo'],
-          {LOCALTIME: f'link {ZONEINFO}/Asia/Tokyo', MARKER: None}, '2025-01-15 21:00 +0900')
+          {LOCALTIME: f'link {ZONEINFO}/Asia/Tokyo', MARKER: None}, '2025-01-15 21:00 +0900',
+          '(The device has no /usr/share/zoneinfo, so that its date was in UTC.)')
 
-    device.put({LOCALTIME: 'link nowhere'})
+    device.put({LOCALTIME: 'link /no/such/zone'})
     start('6. The local-time link was broken.', ['reset_zone'], RESET_ZONE,
           '2025-01-15 05:00 -0700')
 
@@ -93,9 +94,9 @@ the last colon is the last error of any system call: here it means nothing.)''')
         os.utime(path, follow_symlinks=False)
     print(f'''
 Look at the device, change something, and play the next start by hand, from the project's directory:
-    ls -l {PLACE}/var/db/timezone
     ln -sfn /usr/share/zoneinfo/Asia/Tokyo {PLACE}{LOCALTIME}
     {chroot}{PLACE} /mira_tzlinks
+    ls -l {PLACE}/var/db/timezone
 Read next: the diagram in README.md of what a start decides, and man doc/mira_tzlinks.8''')
     return True
 
