@@ -1,12 +1,11 @@
-"""The words to lay out a device, start it, and compare what happens with what should. A device is a
-directory with the program in it, which a process of ours enters by chroot: paths are the system's
-own there, and nothing that a test does can reach what lies outside."""
+"""The words that lay out a device, start it, and compare what happens with what should. A device is
+a directory with the program in it, which a process of ours enters by chroot."""
 
 import ctypes
 import difflib
 import fcntl
+import itertools
 import os
-import pathlib
 import re
 import shutil
 import signal
@@ -28,20 +27,17 @@ WARNINGS = {
     'bad_path': 'mira_dataset::create_components: bad path {}',
     'incompatible': 'Symlink points at data incompatible with installed system',
     'no_data': 'Unable to locate data; resetting to system partition',
-    'no_zoneinfo': 'Bad zoneinfo link : No such file or directory',
     'no_link': 'read_symlink: {}: Invalid argument',
     'not_taken': 'New update not compatible or older version',
     'reset_zone': 'localtime link invalid; resetting to America/Los_Angeles',
     'unparsed': 'Cannot parse version string {0}, results.size() = 0\n'
                 'Cannot parse version string {0}'}
-ERROR = re.compile(': [A-Z][^:]*$')  # the text of an errno, with which each of them ends
-# No start heeds these. AddressSanitizer does, which cannot look for leaks under a tracer.
-VARIABLES = 'DEBUG DESTDIR HOME ICU_DATA ICU_TIMEZONE_FILES_DIR LANG LC_ALL PATH ROOT TZ TZDIR'
-ENVIRONMENT = dict.fromkeys(VARIABLES.split(), '/elsewhere') | {'ASAN_OPTIONS': 'detect_leaks=0'}
-command, arguments = ['/mira_tzlinks'], ['-n', '--version', '/elsewhere', '-h', '--help']
+ERROR = re.compile(r': [A-Z][^:\n]*\Z')  # the text of an errno, with which each of them ends
+VARIABLES = 'DEBUG HOME ICU_DATA ICU_TIMEZONE_FILES_DIR LANG LC_ALL PATH TZ TZDIR'  # not heeded
+command, arguments = ['/mira_tzlinks'], itertools.cycle([[], ['-n'], ['--version'], ['/x', '-h']])
 
-WORDS = {'system': f'link {SYSTEM}', 'file': f'file {DATASETS}/2016g.1.0/x',
-         'directory': 'directory', 'none': None}
+WORDS = {'system': f'link {SYSTEM}', 'directory': 'directory', 'none': None,
+         'file': f'file {DATASETS}/2016g.1.0/x'}
 KINDS = {'-rw-r--r--': 'file', 'drwxr-xr-x': 'directory', 'lrwxrwxrwx': 'link'}
 OLD = 2208988800, 2**31 - 1  # 2040, and what that is on a file system whose dates end before
 harness = set()  # what a device holds for our sake, by path
@@ -49,7 +45,7 @@ libc = ctypes.CDLL(None)
 
 
 def put(tree):
-    """Puts at each path, in place of what is there, what a snapshot shows so; by None nothing."""
+    """Makes each path what the tree says, in the words of a snapshot; None removes it."""
     assert harness, 'outside of a device'
     for path, what in tree.items():
         shutil.rmtree(path, ignore_errors=True)
@@ -58,23 +54,23 @@ def put(tree):
         kind, _, content = (what or '').partition(' ')
         os.makedirs(path if kind == 'directory' else os.path.dirname(path), exist_ok=True)
         if kind == 'file':
-            pathlib.Path(path).write_bytes(os.fsencode(content))
+            open(path, 'wb').write(os.fsencode(content))
         elif kind == 'link':
             os.symlink(content, path)
 
 
 def snapshot():
-    """Returns, by path, what is on the device: `directory`, `link TEXT` or `file CONTENT`, an
+    """Returns, by path, all but the harness: `directory`, `link TEXT` or `file CONTENT`, with an
     unusual mode in place of the word, and ` *` behind a text or content whose time is not OLD."""
     seen = {}
     for parent, directories, files in os.walk('/'):
-        directories[:] = {*directories} - {'proc'}
+        directories[:] = [name for name in directories if os.path.join(parent, name) != '/proc']
         for path in {os.path.join(parent, name) for name in directories + files} - harness:
             status = os.lstat(path)
             mode, changed = stat.filemode(status.st_mode), int(status.st_mtime) not in OLD
             content = os.readlink(path) if mode[0] == 'l' else ''
             if mode[0] == '-':
-                content = os.fsdecode(pathlib.Path(path).read_bytes())
+                content = os.fsdecode(open(path, 'rb').read())
             what = KINDS.get(mode, mode), content, '*' * (changed and mode[0] != 'd')
             seen[path] = ' '.join(filter(None, what))
     return seen
@@ -88,14 +84,13 @@ def data_links(version):
 
 
 def switched(current, latest):
-    """Returns the tree of what a switch from one version to another changes."""
+    """Returns the tree of what a switch changes, but for the marker."""
     return data_links(latest) | {RECORD: f'file {current}_{latest}'}
 
 
 def lay_out(current='system', latest='none', localtime=f'{ZONEINFO}/Asia/Tokyo', besides={}):
-    """Makes the device anew. A link has a text that begins with a slash, a dot or `tz/`, is one of
-    WORDS, or leads to the update of a version, which is then installed. The system and an update
-    have files besides that would count in the other; updates of 2017 have another ICU format."""
+    """Makes the device anew. A link has a text with a slash, a dot or `tz/` first, is one of WORDS,
+    or leads to the update of a version, which is then installed; one of 2017 has other ICU data."""
     put({'/usr/share': None, '/var': None, DATASETS: 'directory', ICU: 'link ./stale',
          f'{SYSTEM}/+VERSION': 'file 2016f\n', f'{SYSTEM}/VERSION': 'file 1a',
          f'{SYSTEM}/Asia/Tokyo': 'file', f'{SYSTEM_ICU}/icutz77e.dat': 'file',
@@ -120,8 +115,8 @@ def lay_out_busy():
 
 def run(*before, prepare=None):
     """Runs the program to its end, behind a command and after a call of `prepare`, if any."""
-    arguments.append(arguments.pop(0))  # another first one at each start
-    process = subprocess.run([*before, *command, *arguments], env=ENVIRONMENT, preexec_fn=prepare,
+    process = subprocess.run([*before, *command, *next(arguments)], preexec_fn=prepare,
+                             env=dict.fromkeys(VARIABLES.split(), '/elsewhere'),
                              stdin=subprocess.DEVNULL, capture_output=True, timeout=20)
     if b'PTRACE' in process.stderr:
         sys.exit(f'system calls cannot be traced here: {process.stderr.splitlines()[0]}')
@@ -130,7 +125,7 @@ def run(*before, prepare=None):
 
 def start(warnings=(), changes={}, status=0, before=(), prepare=None):
     """Runs the program and checks its warnings, its exit status, and the tree of all its changes;
-    returns the process. A warning has `: ERROR` where a call has just failed, and any elsewhere."""
+    returns the process. A warning without `: ERROR` may end with that of any call."""
     for path in snapshot():
         os.utime(path, (OLD[0], OLD[0]), follow_symlinks=False)
     tree = snapshot() | {path: what and f'{what} *' for path, what in changes.items()}
@@ -141,8 +136,7 @@ def start(warnings=(), changes={}, status=0, before=(), prepare=None):
         name, _, argument = word.partition('=')
         for text in WARNINGS.get(name, word).split('\n'):
             text = text.format(argument) + colon + error
-            any_error = '' if ERROR.search(text) else ': any error'
-            texts.append(f'mira_tzlinks: {text}{any_error}')
+            texts.append(f'mira_tzlinks: {text}' + ': any error' * (not ERROR.search(text)))
     lines = re.split(r'\n(?=mira_tzlinks: |\Z)', os.fsdecode(process.stdout + process.stderr))
     lines = [line if line in texts else ERROR.sub(': any error', line) for line in lines]
     compare([*texts, '', f'exit status {status}', *map(': '.join, sorted(expected - seen))],
@@ -158,8 +152,9 @@ def compare(expected, seen):
 
 
 def main(*tools):
-    """Runs, in a device beside PROGRAM, the functions of a script named test_..., once or with each
-    row of the table in their text, if name and row have every WORD. Prints those two before."""
+    """Runs each test of a script, or row of a test's table, that has every WORD in its title."""
+    if not sys.argv[1:]:
+        sys.exit(f'usage: {sys.argv[0]} PROGRAM [WORD]...')
     *emulator, program = sys.argv[1].split(';')  # behind an emulator, calls cannot be traced
     command[:0] = [f'/{os.path.basename(path)}' for path in emulator]
     tests = [function for name, function in vars(sys.modules['__main__']).items()
@@ -177,29 +172,30 @@ def main(*tools):
                     test(*row.partition('#')[0].format(**globals()).split())
                     passed += 1
         print(f'{passed} passed')
-        return passed
+        return passed or sys.exit('no test has every WORD')
 
-    in_device(run_tests, program, f'{os.path.dirname(program)}/device', [*emulator, *tools])
+    in_device(run_tests, program, f'{os.path.dirname(program) or "."}/device', [*emulator, *tools])
 
 
 def in_device(action, program, place, tools=(), keep=False):
-    """Makes the directory `place` a device with the program and the tools, calls `action` in it and
-    ends this process, with 0 when that returned true. The device is kept when it did not, or on
-    demand. Another user becomes root first, in a user namespace or by sudo."""
+    """Becomes root, makes `place` a device with the program and the tools, calls `action` in it and
+    ends this process: with 0 when that returns true, and with 1 and a kept device when it fails."""
     become_root()
     copies = {'/dev/null': '/dev/null', '/mira_tzlinks': program}
     copies |= {f'/{os.path.basename(tool)}': tool for tool in tools}
+    scripts = [os.path.abspath(path) for path in (sys.argv[0], __file__)]  # for a traceback
     for name, tool in [*copies.items()]:
         copies[name] = path = shutil.which(tool, os.F_OK) or sys.exit(f'there is no program {tool}')
         ldd = subprocess.run(['ldd', path], env={}, capture_output=True, text=True).stdout
         copies |= {path: path for path in re.findall(r'\t(?:\S+ => )?(/\S+) \(0x', ldd)}
-    signals = signal.SIGINT, signal.SIGTERM, signal.SIGHUP, signal.SIGCHLD
+    fcntl.flock(os.open(program, os.O_RDONLY), fcntl.LOCK_EX)  # after another run
+    signal.signal(signal.SIGCHLD, signal.SIG_DFL)  # whatever the caller's is
+    remove(place)
+    signals = signal.SIGINT, signal.SIGTERM, signal.SIGHUP, signal.SIGQUIT, signal.SIGCHLD
     signal.pthread_sigmask(signal.SIG_BLOCK, signals)
     libc.prctl(1, signal.SIGTERM)  # for when our own parent has ended
     os.umask(0o022)
-    fcntl.flock(os.open(__file__, os.O_RDONLY), fcntl.LOCK_EX)  # after another run
-    remove(place)
-    for name, path in copies.items():
+    for name, path in [*copies.items(), *zip(scripts, scripts)]:
         os.makedirs(os.path.dirname(place + name), exist_ok=True)
         shutil.copy(path, place + name)
     if (child := os.fork()) == 0:
@@ -211,11 +207,11 @@ def in_device(action, program, place, tools=(), keep=False):
     os.killpg(child, signal.SIGKILL)
     status = os.waitstatus_to_exitcode(os.waitpid(child, 0)[1])
     if status == 1 or status == 0 and keep:
-        subprocess.run(['chown', '-Rh', os.environ.get('SUDO_UID', '0'), place], check=True)
+        subprocess.run(['chown', '-Rh', os.environ.get('SUDO_UID', '0'), place])
         print(f'The device is kept: {place}', file=sys.stderr)
     else:
         remove(place)
-    sys.exit(status)
+    sys.exit(f'ended by signal {-status}' if status < 0 else status)
 
 
 def become_root():
@@ -229,15 +225,14 @@ def become_root():
 
 def remove(place):
     """Removes a directory, if it is there, but no symbolic link and not what is mounted in it."""
-    mounts = pathlib.Path('/proc/self/mountinfo').read_bytes().decode('unicode_escape')
+    mounts = open('/proc/self/mountinfo', 'rb').read().decode('unicode_escape')
     if os.fsencode(os.path.realpath(place)).decode('latin1') in mounts:
         sys.exit(f'{place} is not removed: something is mounted in it')
-    if os.path.lexists(place):
-        shutil.rmtree(place)
+    subprocess.run(['rm', '-rf', '--', place], check=True)
 
 
 def enter(place):
-    if b'__asan_init' in pathlib.Path(f'{place}/mira_tzlinks').read_bytes():  # reads /proc
+    if b'__asan_init' in open(f'{place}/mira_tzlinks', 'rb').read():  # reads /proc
         os.mkdir(f'{place}/proc')
         if (libc.unshare(0x20000) or libc.mount(None, b'/', None, 0x44000, None)
                 or libc.mount(b'/proc', os.fsencode(f'{place}/proc'), None, 0x5000, None)):
