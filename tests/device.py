@@ -36,8 +36,7 @@ ERROR = re.compile(r': [A-Z][^:\n]*\Z')  # the text of an errno, with which each
 VARIABLES = 'DEBUG HOME ICU_DATA ICU_TIMEZONE_FILES_DIR LANG LC_ALL PATH TZ TZDIR'  # not heeded
 command, arguments = ['/mira_tzlinks'], itertools.cycle([[], ['-n'], ['--version'], ['/x', '-h']])
 
-WORDS = {'system': f'link {SYSTEM}', 'directory': 'directory', 'none': None,
-         'file': f'file {DATASETS}/2016g.1.0/x'}
+WORDS = dict(system=f'link {SYSTEM}', directory='directory', none=None, file=f'file {DATASETS}/1a')
 KINDS = {'-rw-r--r--': 'file', 'drwxr-xr-x': 'directory', 'lrwxrwxrwx': 'link'}
 OLD = 2208988800, 2**31 - 1  # 2040, and what that is on a file system whose dates end before
 harness = set()  # what a device holds for our sake, by path
@@ -153,9 +152,7 @@ def compare(expected, seen):
 
 def main(*tools):
     """Runs each test of a script, or row of a test's table, that has every WORD in its title."""
-    if not sys.argv[1:]:
-        sys.exit(f'usage: {sys.argv[0]} PROGRAM [WORD]...')
-    *emulator, program = sys.argv[1].split(';')  # behind an emulator, calls cannot be traced
+    *emulator, program = [*sys.argv, ''][1].split(';')  # behind an emulator, calls are not traced
     command[:0] = [f'/{os.path.basename(path)}' for path in emulator]
     tests = [function for name, function in vars(sys.modules['__main__']).items()
              if name.startswith('test_') and not (emulator and 'traced' in name)]
@@ -183,12 +180,12 @@ def in_device(action, program, place, tools=(), keep=False):
     become_root()
     copies = {'/dev/null': '/dev/null', '/mira_tzlinks': program}
     copies |= {f'/{os.path.basename(tool)}': tool for tool in tools}
-    scripts = [os.path.abspath(path) for path in (sys.argv[0], __file__)]  # for a traceback
+    scripts = [*filter(os.path.exists, map(os.path.abspath, (sys.argv[0], __file__)))]  # for traces
     for name, tool in [*copies.items()]:
         copies[name] = path = shutil.which(tool, os.F_OK) or sys.exit(f'there is no program {tool}')
         ldd = subprocess.run(['ldd', path], env={}, capture_output=True, text=True).stdout
         copies |= {path: path for path in re.findall(r'\t(?:\S+ => )?(/\S+) \(0x', ldd)}
-    fcntl.flock(os.open(program, os.O_RDONLY), fcntl.LOCK_EX)  # after another run
+    fcntl.flock(os.open(copies['/mira_tzlinks'], os.O_RDONLY), fcntl.LOCK_EX)  # after another run
     signal.signal(signal.SIGCHLD, signal.SIG_DFL)  # whatever the caller's is
     remove(place)
     signals = signal.SIGINT, signal.SIGTERM, signal.SIGHUP, signal.SIGQUIT, signal.SIGCHLD
