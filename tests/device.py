@@ -15,9 +15,8 @@ import sys
 
 TZ, TREE, SYSTEM_ICU = '/var/db/timezone', '/usr/share/zoneinfo', '/usr/share/icu'
 DATASETS, LATEST, ZONEINFO, ICU = f'{TZ}/tz', f'{TZ}/tz_latest', f'{TZ}/zoneinfo', '/var/db/icutz'
-SYSTEM, LOCALTIME = f'{TREE}.default', f'{TZ}/localtime'
-DEFAULT_ZONE = f'{ZONEINFO}/America/Los_Angeles'
-MARKER, RECORD = f'{TZ}/needs_cleanup', f'{TZ}/TZVersionDiffRecord'
+SYSTEM, LOCALTIME, MARKER = f'{TREE}.default', f'{TZ}/localtime', f'{TZ}/needs_cleanup'
+RECORD, DEFAULT_ZONE = f'{TZ}/TZVersionDiffRecord', f'{ZONEINFO}/America/Los_Angeles'
 RESET_ZONE = {LOCALTIME: f'link {DEFAULT_ZONE}'}
 
 # The words for warnings. What follows a word and `=` takes the place of the braces.
@@ -34,7 +33,7 @@ WARNINGS = {
                 'Cannot parse version string {0}'}
 ERROR = re.compile(r': [A-Z][^:\n]*\Z')  # the text of an errno, with which each of them ends
 VARIABLES = 'DEBUG HOME ICU_DATA ICU_TIMEZONE_FILES_DIR LANG LC_ALL PATH TZ TZDIR'  # not heeded
-command, arguments = ['/mira_tzlinks'], itertools.cycle([[], ['-n'], ['--version'], ['/x', '-h']])
+command, arguments = ['/mira_tzlinks'], itertools.cycle([[], ['-n'], ['--version'], ['-h', '/x']])
 
 WORDS = dict(system=f'link {SYSTEM}', directory='directory', none=None, file=f'file {DATASETS}/1a')
 KINDS = {'-rw-r--r--': 'file', 'drwxr-xr-x': 'directory', 'lrwxrwxrwx': 'link'}
@@ -66,12 +65,11 @@ def snapshot():
         directories[:] = [name for name in directories if os.path.join(parent, name) != '/proc']
         for path in {os.path.join(parent, name) for name in directories + files} - harness:
             status = os.lstat(path)
-            mode, changed = stat.filemode(status.st_mode), int(status.st_mtime) not in OLD
-            content = os.readlink(path) if mode[0] == 'l' else ''
-            if mode[0] == '-':
-                content = os.fsdecode(open(path, 'rb').read())
-            what = KINDS.get(mode, mode), content, '*' * (changed and mode[0] != 'd')
-            seen[path] = ' '.join(filter(None, what))
+            mode, content, mark = stat.filemode(status.st_mode), '', ''
+            if mode[0] != 'd':
+                content = os.readlink(path) if mode[0] == 'l' else open(path, 'rb').read()
+                mark = '*' * (int(status.st_mtime) not in OLD)
+            seen[path] = ' '.join(filter(None, (KINDS.get(mode, mode), os.fsdecode(content), mark)))
     return seen
 
 
@@ -168,7 +166,6 @@ def main(*tools):
                     print(f'{sys.argv[0]}:{line}: {title}', flush=True)
                     test(*row.partition('#')[0].format(**globals()).split())
                     passed += 1
-        print(f'{passed} passed')
         return passed or sys.exit('no test has every WORD')
 
     in_device(run_tests, program, f'{os.path.dirname(program) or "."}/device', [*emulator, *tools])
@@ -197,7 +194,14 @@ def in_device(action, program, place, tools=(), keep=False):
         shutil.copy(path, place + name)
     if (child := os.fork()) == 0:
         signal.pthread_sigmask(signal.SIG_UNBLOCK, signals)
-        enter(place)
+        if b'__asan_init' in open(f'{place}/mira_tzlinks', 'rb').read():  # reads /proc
+            os.mkdir(f'{place}/proc')
+            if (libc.unshare(0x20000) or libc.mount(None, b'/', None, 0x44000, None)
+                    or libc.mount(b'/proc', os.fsencode(f'{place}/proc'), None, 0x5000, None)):
+                sys.exit('AddressSanitizer takes a mount namespace, which is refused here')
+        os.chroot(place)
+        os.chdir('/')
+        harness.update(snapshot(), ['/trace'])
         sys.exit(not action())
     os.setpgid(child, child)
     signal.sigwait(signals)  # the child has ended, or is to end now
@@ -226,14 +230,3 @@ def remove(place):
     if os.fsencode(os.path.realpath(place)).decode('latin1') in mounts:
         sys.exit(f'{place} is not removed: something is mounted in it')
     subprocess.run(['rm', '-rf', '--', place], check=True)
-
-
-def enter(place):
-    if b'__asan_init' in open(f'{place}/mira_tzlinks', 'rb').read():  # reads /proc
-        os.mkdir(f'{place}/proc')
-        if (libc.unshare(0x20000) or libc.mount(None, b'/', None, 0x44000, None)
-                or libc.mount(b'/proc', os.fsencode(f'{place}/proc'), None, 0x5000, None)):
-            sys.exit('AddressSanitizer takes a mount namespace, which is refused here')
-    os.chroot(place)
-    os.chdir('/')
-    harness.update(snapshot(), ['/trace'])
