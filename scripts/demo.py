@@ -65,7 +65,7 @@ def story():
     compile_tree(invented, f'{dataset}/zoneinfo')
     device.put({f'{dataset}/icutz/icutz44l.dat': 'file', LATEST: f'link {dataset}'})
     start(f'2. The update {year}a was installed: Los Angeles keeps summer time from 2025 on.', (),
-          device.switched(f'{first}.1.0', f'{year}a.1.0'), '2025-01-15 05:00 -0700',
+          device.data_links(f'{year}a.1.0', f'{first}.1.0'), '2025-01-15 05:00 -0700',
           '(This demo has invented the update and its summer time.)')
 
     start('3. Nothing is new.', ['not_taken'], note='''\

@@ -19,8 +19,7 @@ SYSTEM, LOCALTIME, MARKER = f'{TREE}.default', f'{TZ}/localtime', f'{TZ}/needs_c
 RECORD, DEFAULT_ZONE = f'{TZ}/TZVersionDiffRecord', f'{ZONEINFO}/America/Los_Angeles'
 RESET_ZONE = {LOCALTIME: f'link {DEFAULT_ZONE}'}
 
-# The words for warnings. What follows a word and `=` takes the place of the braces.
-WARNINGS = {
+WARNINGS = {  # by word; what follows a word and `=` takes the place of the braces
     'bad_link': 'Bad zoneinfo link {}', 'correcting': 'Correcting localtime link to {}',
     'bad_links': 'Invalid current symlinks; resetting to system partition',
     'bad_path': 'mira_dataset::create_components: bad path {}',
@@ -43,7 +42,7 @@ libc = ctypes.CDLL(None)
 
 
 def put(tree):
-    """Makes each path what the tree says, in the words of a snapshot; None removes it."""
+    """Makes each path a `directory`, `link TEXT` or `file CONTENT`; None removes what is there."""
     assert harness, 'outside of a device'
     for path, what in tree.items():
         shutil.rmtree(path, ignore_errors=True)
@@ -58,8 +57,7 @@ def put(tree):
 
 
 def snapshot():
-    """Returns, by path, all but the harness: `directory`, `link TEXT` or `file CONTENT`, with an
-    unusual mode in place of the word, and ` *` behind a text or content whose time is not OLD."""
+    """Returns the device's tree; an odd mode takes a word's place, ` *` marks a time not OLD."""
     seen = {}
     for parent, directories, files in os.walk('/'):
         directories[:] = [name for name in directories if os.path.join(parent, name) != '/proc']
@@ -73,25 +71,19 @@ def snapshot():
     return seen
 
 
-def data_links(version):
-    """Returns the tree of the data links while the update of a version, or "system", is current."""
-    dataset = f'link {DATASETS}/{version}/'
-    return {ZONEINFO: WORDS.get(version, dataset + 'zoneinfo'),
-            ICU: None if version in WORDS else dataset + 'icutz'}
-
-
-def switched(current, latest):
-    """Returns the tree of what a switch changes, but for the marker."""
-    return data_links(latest) | {RECORD: f'file {current}_{latest}'}
+def data_links(version, before=None):
+    """Returns the tree of the data links to a version or "system", and of a switch's record."""
+    record = {RECORD: f'file {before}_{version}'} if before is not None else {}
+    return record | {ZONEINFO: WORDS.get(version, f'link {DATASETS}/{version}/zoneinfo'),
+                     ICU: None if version in WORDS else f'link {DATASETS}/{version}/icutz'}
 
 
 def lay_out(current='system', latest='none', localtime=f'{ZONEINFO}/Asia/Tokyo', besides={}):
     """Makes the device anew. A link has a text with a slash, a dot or `tz/` first, is one of WORDS,
     or leads to the update of a version, which is then installed; one of 2017 has other ICU data."""
     put({'/usr/share': None, '/var': None, DATASETS: 'directory', ICU: 'link ./stale',
-         f'{SYSTEM}/+VERSION': 'file 2016f\n', f'{SYSTEM}/VERSION': 'file 1a',
-         f'{SYSTEM}/Asia/Tokyo': 'file', f'{SYSTEM_ICU}/icutz77e.dat': 'file',
-         f'{SYSTEM_ICU}/icutzformat.txt': 'file 44l\n'})
+         f'{SYSTEM}/+VERSION': 'file 2016f\n', f'{SYSTEM}/Asia/Tokyo': 'file',
+         f'{SYSTEM_ICU}/icutzformat.txt': 'file 44l\n', f'{SYSTEM_ICU}/icutz77e.dat': 'file'})
     for path, text in (ZONEINFO, current), (LATEST, latest), (LOCALTIME, localtime):
         if text in WORDS or text.startswith(('/', '.', 'tz/')) or path == LOCALTIME:
             put({path: WORDS.get(text, f'link {text}')})
@@ -107,7 +99,7 @@ def lay_out_busy():
     """Lays out a device whose next start changes all it can; returns its warnings and changes."""
     lay_out('2016e.1.0', '2016g.1.0', '/usr/share/zoneinfo/No/Zone')
     return (['incompatible', f'correcting={ZONEINFO}/No/Zone', 'reset_zone: ' + os.strerror(2)],
-            switched('2016f.1.0', '2016g.1.0') | RESET_ZONE | {MARKER: 'file'})
+            data_links('2016g.1.0', '2016f.1.0') | RESET_ZONE | {MARKER: 'file'})
 
 
 def run(*before, prepare=None):
@@ -177,7 +169,6 @@ def in_device(action, program, place, tools=(), keep=False):
     become_root()
     copies = {'/dev/null': '/dev/null', '/mira_tzlinks': program}
     copies |= {f'/{os.path.basename(tool)}': tool for tool in tools}
-    scripts = [*filter(os.path.exists, map(os.path.abspath, (sys.argv[0], __file__)))]  # for traces
     for name, tool in [*copies.items()]:
         copies[name] = path = shutil.which(tool, os.F_OK) or sys.exit(f'there is no program {tool}')
         ldd = subprocess.run(['ldd', path], env={}, capture_output=True, text=True).stdout
@@ -189,7 +180,7 @@ def in_device(action, program, place, tools=(), keep=False):
     signal.pthread_sigmask(signal.SIG_BLOCK, signals)
     libc.prctl(1, signal.SIGTERM)  # for when our own parent has ended
     os.umask(0o022)
-    for name, path in [*copies.items(), *zip(scripts, scripts)]:
+    for name, path in copies.items():
         os.makedirs(os.path.dirname(place + name), exist_ok=True)
         shutil.copy(path, place + name)
     if (child := os.fork()) == 0:
@@ -225,7 +216,7 @@ def become_root():
 
 
 def remove(place):
-    """Removes a directory, if it is there, but no symbolic link and not what is mounted in it."""
+    """Removes what is there, unless something is mounted in it."""
     mounts = open('/proc/self/mountinfo', 'rb').read().decode('unicode_escape')
     if os.fsencode(os.path.realpath(place)).decode('latin1') in mounts:
         sys.exit(f'{place} is not removed: something is mounted in it')

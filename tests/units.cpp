@@ -3,9 +3,7 @@
 #include "components/mira_zoneinfo.h"
 #include "version/mira_version.h"
 
-#include <cerrno>
 #include <cstdio>
-#include <stdexcept>
 
 int main() {
     const mira_icu icu("nowhere");
@@ -14,14 +12,14 @@ int main() {
     try {
         const mira_icu data(std::string(70'000, 'x')); // longer than a walk can hold
     } catch (const int error) {
-        std::printf("ICU data with a path too long: %d\n", error == ENAMETOOLONG);
+        std::printf("ICU data with a path too long: error %d\n", error);
     }
     mira_version version("1b.2.3");
     version.parse("2014");
     std::printf("a refused version is unset: %d\n", version == mira_version());
     try {
         version.parse("2014c.1.2147483648");
-    } catch (const std::out_of_range&) {
+    } catch (...) {
         std::printf("before the number out of range: %d%s.%d.%d\n", version.year,
             version.letters.c_str(), version.major, version.minor);
     }
