@@ -183,7 +183,7 @@ def compare_calls(expected):
     text = '\n'.join(line for _, _, line in trace()).replace('|O_LARGEFILE', '')
     seen = [' '.join(filter(None, call)) for call in CALL.findall(text)]
     opened, closed, pipes = [len(re.findall(call, text, re.MULTILINE)) for call in (
-        r'^open.* = \d', '^close.* = 0', '^pipe')]  # these, by which a sanitizer probes memory
+        r'^open.* = \d', '^close.* = 0', '^pipe')]  # by which a sanitizer probes memory
     compare([*re.split(r',\s+', expected), f'{opened + 2 * pipes} files closed'],
             [*seen, f'{closed} files closed'])
 
