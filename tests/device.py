@@ -30,13 +30,13 @@ WARNINGS = {  # by word; what follows a word and `=` takes the place of the brac
     'reset_zone': 'localtime link invalid; resetting to America/Los_Angeles',
     'unparsed': 'Cannot parse version string {0}, results.size() = 0\n'
                 'Cannot parse version string {0}'}
-ERROR = re.compile(r': [A-Z][^:\n]*\Z')  # the text of an errno, with which each of them ends
+ERROR = re.compile(r': [A-Z][^:\n]*\Z')  # the text of an errno, with which every warning ends
 VARIABLES = 'DEBUG HOME ICU_DATA ICU_TIMEZONE_FILES_DIR LANG LC_ALL PATH TZ TZDIR'  # not heeded
 command, arguments = ['/mira_tzlinks'], itertools.cycle([[], ['-n'], ['--version'], ['-h', '/x']])
 
 WORDS = dict(system=f'link {SYSTEM}', directory='directory', none=None, file=f'file {DATASETS}/1a')
 KINDS = {'-rw-r--r--': 'file', 'drwxr-xr-x': 'directory', 'lrwxrwxrwx': 'link'}
-OLD = 2208988800, 2**31 - 1  # 2040, and what that is on a file system whose dates end before
+OLD = 2208988800, 2**31 - 1  # 2040, or the last date of a file system that ends before
 harness = set()  # what a device holds for our sake, by path
 libc = ctypes.CDLL(None)
 
@@ -79,8 +79,8 @@ def data_links(version, before=None):
 
 
 def lay_out(current='system', latest='none', localtime=f'{ZONEINFO}/Asia/Tokyo', besides={}):
-    """Makes the device anew. A link has a text with a slash, a dot or `tz/` first, is one of WORDS,
-    or leads to the update of a version, which is then installed; one of 2017 has other ICU data."""
+    """Makes the device anew. A link is given by one of WORDS, by its text, which begins with a
+    slash, a dot or `tz/`, or by the version of an update; 2017's have another ICU format."""
     put({'/usr/share': None, '/var': None, DATASETS: 'directory', ICU: 'link ./stale',
          f'{SYSTEM}/+VERSION': 'file 2016f\n', f'{SYSTEM}/Asia/Tokyo': 'file',
          f'{SYSTEM_ICU}/icutzformat.txt': 'file 44l\n', f'{SYSTEM_ICU}/icutz77e.dat': 'file'})
@@ -134,7 +134,7 @@ def start(warnings=(), changes={}, status=0, before=(), prepare=None):
 
 
 def compare(expected, seen):
-    """Ends this process and shows both lists of lines, unless they are the same."""
+    """Shows both lists of lines and ends this process, unless they are the same."""
     if expected != seen:
         lines = difflib.unified_diff(expected, seen, 'expected', 'seen', n=99, lineterm='')
         sys.exit('\n'.join(line[:300] for line in lines))

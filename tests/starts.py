@@ -1,5 +1,5 @@
 #!/usr/bin/env -S python3 -EsB
-"""What a start finds, makes of that and asks of the system, and what is left of one disturbed."""
+"""What a start does, and what a disturbed one leaves. Usage: starts.py PROGRAM [WORD...]"""
 
 import os
 import re
@@ -20,7 +20,7 @@ FIRST_CALLS = f'''open {TZ}/ O_RDONLY|O_CLOEXEC, fcntl 0x4, open {TZ}/tz/ O_RDON
 
 
 def test_dataset(current, latest, then, marker, record, *warnings):
-    """Which dataset is current after a start, by that before and the latest; the system has 2016f.
+    """The dataset current after a start, by the one before and the latest; the system has 2016f.
 
     current        latest       then      marker record              warnings
     system         2016g.1.0    2016g.1.0 none   2016f.1.0_2016g.1.0
@@ -62,7 +62,7 @@ def test_link_names_no_dataset():
 
 
 def test_local_time(then, warnings, link, *links):
-    """What happens to a local-time link of each text.
+    """What a start makes of a local-time link, by its text.
 
     then      warnings              links
     kept      -                     {ZONEINFO}/No/Zone {ZONEINFO} {ZONEINFO}X {ZONEINFO}/../x
@@ -203,9 +203,9 @@ def test_traced_calls():
 
 
 def test_traced_and_disturbed(current, latest, *losses):
-    """Calls fail, or the power is cut before a change: the manual's CAVEATS have what is lost then.
+    """A call fails, or the power is cut before a change: the manual's CAVEATS list what is lost.
 
-    current    latest     losses, each behind the file of the call, by the first letters of names
+    current    latest     losses: the file of the call and the file lost, by first letters
     2016f.1.1  2016g.1.0  TZV:TZV icu:TZV icu:icu icu:nee loc:loc nee:TZV nee:nee zon:TZV zon:nee
     2016e.1.0  none       icu:icu icu:nee loc:loc nee:nee zon:nee
     """

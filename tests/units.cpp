@@ -1,4 +1,4 @@
-// What no device can show. CMakeLists.txt has the end of the output that is expected.
+// What no device can show. CMakeLists.txt has the output that is expected.
 #include "components/mira_icu.h"
 #include "components/mira_zoneinfo.h"
 #include "version/mira_version.h"

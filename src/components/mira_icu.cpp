@@ -21,8 +21,8 @@ struct walk_closer {
 };
 using file_walk = std::unique_ptr<FTS, walk_closer>;
 
-/// Where a `long` is too short for a date, the GNU C library's walk cannot change into a directory
-/// dated after 2038. There it does not change directories.
+/// With a `long` too short for a date, the GNU C library's walk cannot change into a directory
+/// dated after 2038: there it changes into none.
 constexpr int stay_in_place = sizeof(long) < sizeof(std::time_t) ? FTS_NOCHDIR : 0;
 
 /// Opens a walk that follows no link except `root` itself and does not leave its file system.
