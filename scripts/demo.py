@@ -106,7 +106,7 @@ first = (re.match('# version ([0-9]{4}[a-z]+)', source) or sys.exit('tzdata.zi h
 year = int(first[:4]) + 1
 dataset = f'{DATASETS}/{year}a.1.0'
 # The zone's last line ends with 2024; another follows.
-invented = re.sub(r'(?m)^Z America/Los_Angeles .*(\n-?\d.*)*', r'\g<0> 2025\n-7 - PDT', source, 1)
+invented = re.sub(r'(?m)^Z America/Los_Angeles .*(\n-?\d.*)*', r'\g<0> 2025\n-7 - PDT', source)
 chroot = 'sudo chroot ' if 'SUDO_UID' in os.environ else 'chroot '
 if os.stat('/').st_uid:  # the machine's, which root of a user's own namespace does not own
     chroot = 'unshare --map-root-user --root='

@@ -73,7 +73,7 @@ def snapshot():
 
 def data_links(version, before=None):
     """Returns the tree of the data links to a version or "system", and of a switch's record."""
-    record = {RECORD: f'file {before}_{version}'} if before is not None else {}
+    record = {RECORD: f'file {before}_{version}'} if before else {}
     return record | {ZONEINFO: WORDS.get(version, f'link {DATASETS}/{version}/zoneinfo'),
                      ICU: None if version in WORDS else f'link {DATASETS}/{version}/icutz'}
 
@@ -220,4 +220,4 @@ def remove(place):
     mounts = open('/proc/self/mountinfo', 'rb').read().decode('unicode_escape')
     if os.fsencode(os.path.realpath(place)).decode('latin1') in mounts:
         sys.exit(f'{place} is not removed: something is mounted in it')
-    subprocess.run(['rm', '-rf', '--', place], check=True)
+    subprocess.run(['rm', '-rf', '--one-file-system', '--', place], check=True)

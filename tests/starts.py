@@ -73,8 +73,8 @@ def test_local_time(then, warnings, link, *links):
     reset     reset_zone            {DATASETS}/2016g.1.0/zoneinfo/Asia/Tokyo /..{SYSTEM}/Asia/Tokyo
     reset     no_link={LOCALTIME},reset_zone directory
     """
-    zones = {'Asia/Tokyo': 'file', 'New': 'file', 'Gone': 'link nowhere'}.items()
-    zones = {f'{DATASETS}/2016g.1.0/zoneinfo/{zone}': what for zone, what in zones}
+    tree = f'{DATASETS}/2016g.1.0/zoneinfo'
+    zones = {f'{tree}/Asia/Tokyo': 'file', f'{tree}/New': 'file', f'{tree}/Gone': 'link nowhere'}
     for link in (link, *links):
         lay_out('system', '2016g.1.0', link, zones | {'/var/db/icu/entry': 'file'})
         corrected = link.replace(TREE, ZONEINFO, 1)
