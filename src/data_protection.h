@@ -3,16 +3,10 @@
 #include <fcntl.h>
 
 /// The target's data protection: a file or directory belongs to a numbered protection class, which
-/// determines when its content can be read.
-///
-/// The build looks for both names in the host's <fcntl.h>; this header defines those that it does
-/// not find. A port to a host that has data protection under other names has to provide
-/// - `F_SETPROTECTIONCLASS`, a command for `fcntl` that puts the open file or directory into the
-///   class given as its argument. Its failure is ignored, so on a host without data protection any
-///   number will do that `fcntl` refuses;
-/// - `open_dprotected_np`, as defined below.
+/// determines when its content can be read. This header defines what the host's <fcntl.h> lacks.
 
-#ifndef MIRA_HAVE_F_SETPROTECTIONCLASS
+#ifndef F_SETPROTECTIONCLASS
+/// The command for `fcntl` that puts the open file or directory into the class given as argument.
 inline constexpr int F_SETPROTECTIONCLASS = 64;
 #endif
 

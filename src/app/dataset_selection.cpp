@@ -9,6 +9,7 @@
 #include <string>
 
 #include <err.h>
+#include <fcntl.h>
 #include <sys/stat.h>
 #include <unistd.h>
 
@@ -72,7 +73,7 @@ void select_dataset() {
         return;
     }
     const mira_dataset latest(latest_path);
-    // Compared with `current` and not with `*active`, on purpose; the header says so.
+    // The system compares with the dataset that was current at the boot, also after a reset.
     if (!latest.compatible_schema(system) || !latest.newer_than(current)) {
         warn("New update not compatible or older version");
         return;

@@ -8,12 +8,11 @@
 ///   dataset, also resets them ("Symlink points at data incompatible with installed system").
 /// - A latest dataset that has the system's ICU format and is newer than the current one is linked
 ///   and written to the version record; any other is reported ("New update not compatible or older
-///   version"). After a reset for format or age it is still compared with the dataset that was
-///   current before, even if the system dataset is newer than both. A missing latest link is no
-///   failure.
+///   version"). The current one is that of the boot, also after a reset for format or age: the
+///   manual's CAVEATS say what follows. A missing latest link is no failure.
 ///
-/// An updated dataset that is given up because of its format or age or in a switch touches the
-/// clean-up marker ("Cannot touch file %s" on failure). A failure to write the record is ignored.
+/// A reset for format or age, and a switch from one update to another, touch the clean-up marker
+/// ("Cannot touch file %s" on failure). A failure to write the record is ignored.
 ///
 /// Throws what reading the latest link, building a dataset or creating a link throws. Links that
 /// were changed before the failure stay changed.

@@ -14,8 +14,8 @@ namespace {
 constexpr char default_zone[] = "America/Los_Angeles";
 
 void replace_localtime_link(const std::string& target) {
-    // Not fsutil::remove: an empty directory is deleted too, and nothing is reported. An entry
-    // that stays makes create_symlink fail, which reports it.
+    // std::remove also deletes an empty directory, and reports nothing. An entry that stays makes
+    // create_symlink fail, which reports it.
     std::remove(paths::localtime_link);
     fsutil::create_symlink(target, paths::localtime_link);
 }

@@ -11,8 +11,8 @@
 int main() try {
     prepare_process();
     prepare_timezone_directories();
-    // Left over from earlier starts or systems. Not fsutil::remove: an empty directory is deleted
-    // too, and a failure is neither reported nor thrown.
+    // Left over from earlier boots or systems. std::remove also deletes an empty directory, and
+    // reports nothing.
     std::remove(paths::cleanup_marker);
     std::remove(paths::stale_icu);
     try {

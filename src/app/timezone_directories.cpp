@@ -3,6 +3,7 @@
 #include "data_protection.h"
 #include "paths.h"
 
+#include <fcntl.h>
 #include <unistd.h>
 
 namespace {

@@ -1,7 +1,6 @@
 #pragma once
 
 #include <string>
-#include <utility>
 
 /// One kind of time-zone data inside a dataset. A component reads its data's version or format when
 /// it is built and does not change afterwards.
@@ -19,8 +18,8 @@ public:
     virtual void make_current() const = 0;
 
 protected:
-    explicit mira_dataset_component(std::string dataset_path = {})
-        : dataset_path_(std::move(dataset_path)) {}
+    explicit mira_dataset_component(const std::string& dataset_path = {})
+        : dataset_path_(dataset_path) {}
     ~mira_dataset_component() = default;
 
     /// The directory of the dataset; empty for the system dataset.

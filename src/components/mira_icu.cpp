@@ -21,8 +21,8 @@ struct walk_closer {
 };
 using file_walk = std::unique_ptr<FTS, walk_closer>;
 
-/// With a `long` too short for a date, the GNU C library's walk cannot change into a directory
-/// dated after 2038: there it changes into none.
+/// With a 32-bit `long`, the GNU C library's walk fails to read a directory dated past 2038, unless
+/// it stays in the working directory.
 constexpr int stay_in_place = sizeof(long) < sizeof(std::time_t) ? FTS_NOCHDIR : 0;
 
 /// Opens a walk that follows no link except `root` itself and does not leave its file system.
@@ -56,15 +56,11 @@ mira_icu::mira_icu(const std::string& dataset_path)
 
 void mira_icu::initialize() {
     if (dataset_path().empty()) {
-        read_system_format();
+        std::ifstream file(icu_path_ + "/icutzformat.txt");
+        file >> format_;
     } else {
         find_format();
     }
-}
-
-void mira_icu::read_system_format() {
-    std::ifstream file(icu_path_ + "/icutzformat.txt");
-    file >> format_;
 }
 
 /// Takes the format from the name of the first data file that the walk finds. Only names in the
@@ -73,12 +69,14 @@ void mira_icu::find_format() {
     // Over wide characters for the reason given in mira_version.cpp.
     const std::wregex data_file_name(LR"(icutz([0-9]+[lbe])\.dat)");
     const file_walk walk = open_walk(icu_path_);
-    const FTSENT* entry = nullptr;
-    while (format_.empty() && (entry = ::fts_read(walk.get())) != nullptr) {
-        const std::wstring name(entry->fts_name, entry->fts_name + entry->fts_namelen);
-        std::wsmatch match;
-        if (may_be_data_file(*entry) && std::regex_match(name, match, data_file_name)) {
-            format_.assign(match[1].first, match[1].second);
+    while (const FTSENT* const entry = ::fts_read(walk.get())) {
+        if (may_be_data_file(*entry)) {
+            const std::wstring name(entry->fts_name, entry->fts_name + entry->fts_namelen);
+            std::wsmatch match;
+            if (std::regex_match(name, match, data_file_name)) {
+                format_.assign(match[1].first, match[1].second);
+                return;
+            }
         }
     }
 }

@@ -28,7 +28,6 @@ public:
 
 private:
     void initialize();
-    void read_system_format();
     void find_format();
 
     /// Compared as text only. Empty when unknown.

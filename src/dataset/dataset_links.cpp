@@ -3,6 +3,7 @@
 #include "fsutil/fsutil.h"
 #include "paths.h"
 
+#include <cstddef>
 #include <string_view>
 
 #include <err.h>

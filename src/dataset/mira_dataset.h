@@ -23,13 +23,16 @@ public:
     /// components throw.
     explicit mira_dataset(const std::string& path = {});
 
+    const mira_version& version() const { return version_; }
     std::string version_string() const { return version_string_; }
 
     /// Returns whether the paths of both are equal, byte for byte.
     bool operator==(const mira_dataset& other) const { return path_ == other.path_; }
 
     /// Returns whether this dataset's version is strictly newer than `other`'s.
-    bool newer_than(const mira_dataset& other) const { return version_.newer_than(other.version_); }
+    bool newer_than(const mira_dataset& other) const {
+        return version().newer_than(other.version());
+    }
 
     /// Returns whether a system that reads `other`'s data can read this dataset's: as many
     /// components, and each compatible with `other`'s at its position.

@@ -13,7 +13,7 @@ void fsutil::remove(const std::string& path) {
     }
 }
 
-bool fsutil::exists(const std::string& path) {
+bool fsutil::exists(const std::string& path) noexcept {
     return ::access(path.c_str(), F_OK) == 0;
 }
 

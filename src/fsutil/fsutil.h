@@ -14,8 +14,8 @@ namespace fsutil {
 void remove(const std::string& path);
 
 /// Returns whether something exists at `path`, with links followed: false for a dangling link and
-/// for a path that cannot be examined. Never warns or throws.
-bool exists(const std::string& path);
+/// for a path that cannot be examined. Writes no warning.
+bool exists(const std::string& path) noexcept;
 
 /// Returns the text of the link at `path`, unresolved and cut to its first 1,024 bytes; empty when
 /// the path is missing.
