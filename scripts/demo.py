@@ -1,44 +1,44 @@
-"""Makes build/demo a sample device, plays six starts of it, and checks after each that the program
-changed what it should and nothing else."""
+"""Makes build/demo a sample device, plays six starts of the program on it, and checks after each
+that the program changed what it should and nothing else."""
 
 import os
 import pathlib
 import re
 import subprocess
 import sys
-import time
 
 sys.path.insert(0, 'tests')
-import device  # noqa: E402
-from device import DATASETS, LATEST, LOCALTIME, MARKER, RESET_ZONE, SYSTEM, ZONEINFO  # noqa: E402
+from device import (BAD_LINKS, DATASETS, DEFAULT_ZONE, ICU, INCOMPATIBLE, LATEST,  # noqa: E402
+                    LOCALTIME, MARKER, NOT_TAKEN, RECORD, SYSTEM_ICU, SYSTEM_ZONEINFO, ZONEINFO,
+                    ZONE_RESET, Device, links_to, switch)
 
-PLACE = 'build/demo'
 FACTS = {
     'zoneinfo': (ZONEINFO, 'the link to the tz database in use'),
-    'icutz': (device.ICU, "the link to an update's ICU data"),
+    'icutz': (ICU, "the link to an update's ICU data"),
     'localtime': (LOCALTIME, 'the link to the local time zone, through the first'),
-    'marker': (MARKER, 'touched when an update is given up, for other programs to clean up'),
-    'record': (device.RECORD, 'the versions before and after the last switch to an update'),
-    'date': ('date', 'noon in London on 15 January 2025, as others read it through the links'),
+    'marker': (MARKER, 'touched when an update is reset or replaced, for others to clean up'),
+    'record': (RECORD, 'the versions before and after the last switch to an update'),
+    'date': ('date', 'noon in London on 15 January 2025, as another program reads it'),
 }
 
 
 def facts():
-    for os.environ['TZ'] in 'UTC', f':{LOCALTIME}':  # a TZ that stays is not read again
-        time.tzset()
-    date = time.strftime('date %F %H:%M %z', time.localtime(1736942400))
+    command = [*device.before_chroot, 'env', '-i', f'TZ=:{LOCALTIME}', *device.chroot, '/date',
+               '-d', '@1736942400', '+date %F %H:%M %z']
+    date = subprocess.run(command, check=True, capture_output=True, text=True).stdout.strip()
     seen = device.snapshot() | {'date': date}
-    return {name: seen.get(path, ' none').removesuffix(' *').partition(' ')[2] or 'touched'
+    return {name: seen.get(path, ' none').partition(' ')[2] or 'touched'
             for name, (path, _) in FACTS.items()}
 
 
 def start(title, warnings=(), changes={}, date=None, note=''):
-    """Starts the device, prints what that did, and fails when it was something else."""
+    """Starts the program, prints what that did, and fails when it was something else."""
     print(f'\n{title}')
     before = facts()
-    process = device.start(warnings, changes)
+    process = device.check_start(warnings, changes)
     after = facts()
-    device.compare([f'date {date or before["date"]}'], [f'date {after["date"]}'])
+    if after['date'] != (date or before['date']):
+        sys.exit(f'the date is {after["date"]}')
     for line in (os.fsdecode(process.stderr) + note).splitlines():
         print(f'   {line}')
     for name, (_, meaning) in FACTS.items():
@@ -50,64 +50,56 @@ def start(title, warnings=(), changes={}, date=None, note=''):
 
 
 def compile_tree(source, directory):
-    subprocess.run(['/zic', '-d', directory, '-'], input=source, text=True, check=True)
-
-
-def story():
-    error = os.strerror(2)
-    compile_tree(source, SYSTEM)
-    device.put({f'{SYSTEM}/+VERSION': f'file {first}\n', DATASETS: 'directory',
-                f'{device.SYSTEM_ICU}/icutzformat.txt': 'file 44l\n'})
-    start(f'1. The first start: the system partition has {first}, and there is no link yet.',
-          [f'bad_link=: {error}', f'bad_links: {error}', f'reset_zone: {error}'],
-          {ZONEINFO: f'link {SYSTEM}'} | RESET_ZONE, '2025-01-15 04:00 -0800')
-
-    compile_tree(invented, f'{dataset}/zoneinfo')
-    device.put({f'{dataset}/icutz/icutz44l.dat': 'file', LATEST: f'link {dataset}'})
-    start(f'2. The update {year}a was installed: Los Angeles keeps summer time from 2025 on.', (),
-          device.data_links(f'{year}a.1.0', f'{first}.1.0'), '2025-01-15 05:00 -0700',
-          '(This demo has invented the update and its summer time.)')
-
-    start('3. Nothing is new.', ['not_taken'], note='''\
-(Every ordinary start after an update looks like this and prints this warning. What follows
-the last colon is the last error of any system call: here it means nothing.)''')
-
-    compile_tree(invented, SYSTEM)
-    device.put({f'{SYSTEM}/+VERSION': f'file {year}b\n'})
-    start(f'4. The system partition was upgraded to {year}b, past the update.',
-          ['incompatible', 'not_taken'], device.data_links('system') | {MARKER: 'file'})
-
-    device.put({LATEST: None, dataset: None, LOCALTIME: 'link /usr/share/zoneinfo/Asia/Tokyo'})
-    start('5. Another program cleaned up the update, and linked local time past the zoneinfo link.',
-          [f'correcting={ZONEINFO}/Asia/Tokyo'],
-          {LOCALTIME: f'link {ZONEINFO}/Asia/Tokyo', MARKER: None}, '2025-01-15 21:00 +0900',
-          '(The device has no /usr/share/zoneinfo, so that its date was in UTC.)')
-
-    device.put({LOCALTIME: 'link /no/such/zone'})
-    start('6. The local-time link was broken.', ['reset_zone'], RESET_ZONE,
-          '2025-01-15 05:00 -0700')
-
-    # What stays is the device alone, with the times of today.
-    for name in set(os.listdir('/')) - {'mira_tzlinks', 'usr', 'var'}:
-        device.put({f'/{name}': None})
-    for path in device.snapshot():
-        os.utime(path, follow_symlinks=False)
-    print(f'''
-Look at the device, change something, and play the next start by hand, from the project's directory:
-    ln -sfn /usr/share/zoneinfo/Asia/Tokyo {PLACE}{LOCALTIME}
-    {chroot}{PLACE} /mira_tzlinks
-    ls -l {PLACE}/var/db/timezone
-Read next: the diagram in README.md of what a start decides, and man doc/mira_tzlinks.8''')
-    return True
+    subprocess.run(['zic', '-d', device.outside(directory), '-'], input=source, text=True,
+                   check=True)
 
 
 source = pathlib.Path('/usr/share/zoneinfo/tzdata.zi').read_text()
 first = (re.match('# version ([0-9]{4}[a-z]+)', source) or sys.exit('tzdata.zi has no version'))[1]
 year = int(first[:4]) + 1
-dataset = f'{DATASETS}/{year}a.1.0'
+update = f'{DATASETS}/{year}a.1.0'
 # The zone's last line ends with 2024; another follows.
 invented = re.sub(r'(?m)^Z America/Los_Angeles .*(\n-?\d.*)*', r'\g<0> 2025\n-7 - PDT', source)
-chroot = 'sudo chroot ' if 'SUDO_UID' in os.environ else 'chroot '
-if os.stat('/').st_uid:  # the machine's, which root of a user's own namespace does not own
-    chroot = 'unshare --map-root-user --root='
-device.in_device(story, 'build/release/mira_tzlinks', PLACE, ['zic'], keep=True)
+
+device = Device('build', 'demo', ['build/release/mira_tzlinks'], ['date'])
+device.put({f'{SYSTEM_ZONEINFO}/+VERSION': f'file {first}\n', DATASETS: 'directory',
+            f'{SYSTEM_ICU}/icutzformat.txt': 'file 44l\n'})
+compile_tree(source, SYSTEM_ZONEINFO)
+error = os.strerror(2)
+start(f'1. The first start: the system partition has {first}, and there is no link yet.',
+      [f'Bad zoneinfo link : {error}', f'{BAD_LINKS}: {error}', f'{ZONE_RESET}: {error}'],
+      {ZONEINFO: f'link {SYSTEM_ZONEINFO}'} | DEFAULT_ZONE, '2025-01-15 04:00 -0800', '''\
+(What follows the last colon of a warning is the last error of any system call. Here a link is
+missing; where no call has just failed, it means nothing.)''')
+
+device.put({f'{update}/icutz/icutz44l.dat': 'file', LATEST: f'link {update}'})
+compile_tree(invented, f'{update}/zoneinfo')
+start(f'2. The update {year}a was installed: Los Angeles keeps summer time from 2025 on.', (),
+      switch(f'{first}.1.0', f'{year}a.1.0'), '2025-01-15 05:00 -0700',
+      '(This demo has invented the update and its summer time.)')
+
+start('3. Nothing is new.', [NOT_TAKEN], note='''\
+(Every ordinary start after an update looks like this and prints this warning.)''')
+
+device.put({f'{SYSTEM_ZONEINFO}/+VERSION': f'file {year}b\n'})
+start(f'4. The system partition was upgraded to {year}b, past the update, without that summer time.',
+      [INCOMPATIBLE, NOT_TAKEN], links_to('system') | {MARKER: 'file'}, '2025-01-15 04:00 -0800')
+
+device.put({LATEST: None, update: None, LOCALTIME: 'link /usr/share/zoneinfo/Asia/Tokyo'})
+start('5. Another program cleaned up the update, and linked local time past the zoneinfo link.',
+      [f'Correcting localtime link to {ZONEINFO}/Asia/Tokyo'],
+      {LOCALTIME: f'link {ZONEINFO}/Asia/Tokyo', MARKER: None}, '2025-01-15 21:00 +0900',
+      '(The device has no /usr/share/zoneinfo, so that its date was in UTC.)')
+
+device.put({LOCALTIME: 'link /no/such/zone'})
+start('6. The local-time link was broken.', [ZONE_RESET], DEFAULT_ZONE, '2025-01-15 04:00 -0800')
+
+for path in device.snapshot():
+    os.utime(device.outside(path), follow_symlinks=False)  # the dates of today
+program = ' '.join([*device.before_chroot[1:], 'chroot build/demo'])
+print(f'''
+Look at the device, change something, and start the program by hand, from the project's directory:
+    ln -sfn /usr/share/zoneinfo/Asia/Tokyo build/demo{LOCALTIME}
+    {program} /mira_tzlinks
+    ls -l build/demo/var/db/timezone
+Read next: the diagram in README.md of what a start decides, and doc/mira_tzlinks.8, the manual''')
