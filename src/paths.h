@@ -20,7 +20,7 @@ inline constexpr char icu_link[] = "/var/db/icutz";
 inline constexpr char localtime_link[] = "/var/db/timezone/localtime";
 inline constexpr char default_localtime[] = "/var/db/timezone/zoneinfo/America/Los_Angeles";
 
-// Files that a run writes for other programs, and one that it only deletes.
+// Files that a start writes for other programs, and one that it only deletes.
 inline constexpr char cleanup_marker[] = "/var/db/timezone/needs_cleanup";
 inline constexpr char version_record[] = "/var/db/timezone/TZVersionDiffRecord";
 inline constexpr char stale_icu[] = "/var/db/icu";

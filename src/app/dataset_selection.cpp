@@ -73,7 +73,7 @@ void select_dataset() {
         return;
     }
     const mira_dataset latest(latest_path);
-    // The system compares with the dataset that was current at the boot, also after a reset.
+    // A rule of the system: a reset does not change what the latest dataset is compared with.
     if (!latest.compatible_schema(system) || !latest.newer_than(current)) {
         warn("New update not compatible or older version");
         return;

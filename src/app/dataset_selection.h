@@ -8,8 +8,9 @@
 ///   dataset, also resets them ("Symlink points at data incompatible with installed system").
 /// - A latest dataset that has the system's ICU format and is newer than the current one is linked
 ///   and written to the version record; any other is reported ("New update not compatible or older
-///   version"). The current one is that of the boot, also after a reset for format or age: the
-///   manual's CAVEATS say what follows. A missing latest link is no failure.
+///   version"). It is compared with the dataset that was current when the program was started, also
+///   after a reset for format or age; the manual's CAVEATS say what follows. A missing latest link
+///   is no failure.
 ///
 /// A reset for format or age, and a switch from one update to another, touch the clean-up marker
 /// ("Cannot touch file %s" on failure). A failure to write the record is ignored.

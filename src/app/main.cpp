@@ -11,7 +11,7 @@
 int main() try {
     prepare_process();
     prepare_timezone_directories();
-    // Left over from earlier boots or systems. std::remove also deletes an empty directory, and
+    // Left over from earlier starts or systems. std::remove also deletes an empty directory, and
     // reports nothing.
     std::remove(paths::cleanup_marker);
     std::remove(paths::stale_icu);

@@ -28,7 +28,7 @@ mira_version::mira_version(const std::string& text) {
 
 void mira_version::parse(const std::string& text) {
     // Each byte as a wide character: for each bracket of an expression over `char`, libstdc++ makes
-    // a table of all 256 values in advance, which costs more than all the matches of a run.
+    // a table of all 256 values in advance, which costs more than all the matches of a start.
     const std::wstring bytes(text.begin(), text.end());
     const std::wregex grammar(LR"(([0-9]+)([a-z]+)(?:\.([0-9]+))?(?:\.([0-9]+))?)", any_length);
     std::wsmatch results;
