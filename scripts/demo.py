@@ -8,9 +8,9 @@ import subprocess
 import sys
 
 sys.path.insert(0, 'tests')
-from device import (BAD_LINKS, DATASETS, DEFAULT_ZONE, ICU, INCOMPATIBLE, LATEST,  # noqa: E402
-                    LOCALTIME, MARKER, NOT_TAKEN, RECORD, SYSTEM_ICU, SYSTEM_ZONEINFO, ZONEINFO,
-                    ZONE_RESET, Device, links_to, switch)
+from device import (BAD_LINKS, DATASETS, DEFAULT_ZONE, ENVIRONMENT, ICU, INCOMPATIBLE,  # noqa: E402
+                    LATEST, LOCALTIME, MARKER, NOT_TAKEN, RECORD, SYSTEM_ICU, SYSTEM_ZONEINFO,
+                    ZONEINFO, ZONE_RESET, Device, links_to, switch)
 
 FACTS = {
     'zoneinfo': (ZONEINFO, 'the link to the tz database in use'),
@@ -23,10 +23,10 @@ FACTS = {
 
 
 def facts():
-    command = [*device.before_chroot, 'env', '-i', f'TZ=:{LOCALTIME}', *device.chroot, '/date',
+    command = [*device.before_chroot, 'env', f'TZ=:{LOCALTIME}', *device.chroot, '/date',
                '-d', '@1736942400', '+date %F %H:%M %z']
-    date = subprocess.run(command, check=True, capture_output=True, text=True).stdout.strip()
-    seen = device.snapshot() | {'date': date}
+    date = subprocess.run(command, env=ENVIRONMENT, check=True, capture_output=True, text=True)
+    seen = device.snapshot() | {'date': date.stdout.strip()}
     return {name: seen.get(path, ' none').partition(' ')[2] or 'touched'
             for name, (path, _) in FACTS.items()}
 

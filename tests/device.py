@@ -32,9 +32,9 @@ ZONE_RESET = 'localtime link invalid; resetting to America/Los_Angeles'
 ERROR = re.compile(r': [A-Z][^:\n]*\Z')  # with which every warning ends
 
 KINDS = {0o100644: 'file', 0o120777: 'link', 0o40755: 'directory'}
-IGNORED = 'DEBUG HOME ICU_DATA ICU_TIMEZONE_FILES_DIR LANG LC_ALL TZ TZDIR'.split()
-PATH = os.environ.get('PATH', os.defpath) + ':/usr/sbin'
-ENVIRONMENT = dict.fromkeys(IGNORED, '/elsewhere') | {'PATH': PATH}
+ENVIRONMENT = {'PATH': os.environ.get('PATH', os.defpath) + ':/usr/sbin'}
+for name in 'DEBUG HOME ICU_DATA ICU_TIMEZONE_FILES_DIR LANG LC_ALL TZ TZDIR'.split():
+    ENVIRONMENT[name] = '/elsewhere'
 
 
 def links_to(version):
@@ -76,7 +76,7 @@ class Device:
         self.fixed = self.snapshot()
 
     def way_in(self):
-        """Returns the words before a command that calls chroot, and those of the call."""
+        """Returns the words before a command that calls chroot, and those that call it."""
         user = f'--userspec=+{os.getuid()}:+{os.getgid()}'
         for way, options in ([], []), (['unshare', '--map-root-user'], []), (['sudo'], [user]):
             enter = ['env', *way, 'chroot', '/', 'true']
@@ -102,8 +102,7 @@ class Device:
         for path, what in tree.items():
             path = self.outside(path)
             shutil.rmtree(path, ignore_errors=True)
-            if os.path.lexists(path):
-                os.remove(path)
+            pathlib.Path(path).unlink(missing_ok=True)
             kind, _, content = (what or '').partition(' ')
             os.makedirs(path if kind == 'directory' else os.path.dirname(path), exist_ok=True)
             if kind == 'link':

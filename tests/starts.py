@@ -85,16 +85,16 @@ class Versions(StartTest):
     def test_refused(self):
         texts = '''2014 a a2014 2014A 2014aA 2014a. 2014a.b 2014a.1b 2014a.1. 2014a1 2014a.1.0.2
             2014a+1 2014` 2014{ 201/a 201:a 2014a./ 2014a.1.: 2014a/ 2014a..1 2014\udce9'''.split()
-        for text in [*texts, ' 2014a', '2014a ', '2014a\n']:
+        for text in [*texts, ' 2014a', '2014a ', '2014a\n', 70 * 'x']:
             self.check(['system', f'link {DATASETS}/{text}'], [*unparsed(text), NOT_TAKEN])
         for text, version in ('x/', 'x'), ('1a//b', '1a/'), ('1a/b/c', '1a/b'):
             self.check([f'link {DATASETS}/{text}'], [*unparsed(version), INCOMPATIBLE],
                        SYSTEM | {MARKER: 'file'})
 
     def test_of_the_system(self):
-        for text, word in ((' \t\v\f\r\n2016f extra\n1a', '2016f'), ('A\udcff', 'A\udcff'),
-                           (f'2016{10**5 * "f"}\v', f'2016{10**5 * "f"}'), (' \n\t', '')):
-            warnings = [] if word[:1].isdigit() else 2 * unparsed(f'{word}.1.0')
+        for text, word in ((' \t\v\f\r\n2016f extra\n1a', '2016f'), ('1a.1', '1a.1'), (' \n', ''),
+                           (f'2016{10**5 * "f"}\v', f'2016{10**5 * "f"}'), ('\udcff', '\udcff')):
+            warnings = [] if word[-1:] == 'f' else 2 * unparsed(f'{word}.1.0')
             self.check(['system', '2999a'], warnings, switch(f'{word}.1.0', '2999a'),
                        {VERSION: f'file {text}'})
         self.check([], [NO_DATA], besides={VERSION: 'file 2147483648a'}, status=1)
@@ -116,9 +116,10 @@ class IcuData(StartTest):
     def test_no_format(self):
         self.check_format(False, 'file junk', 'icutz44x.dat')
         for name in '''44L.dat 44x.dat l.dat 44.dat 44l.dat.bak 44l.DAT 44lxdat :l.dat 4\udcb2l.dat
-                -4l.dat /l.dat /icutz44l.dat'''.split():
+                44l 44le.dat /l.dat /icutz44l.dat'''.split():
             self.check_format(True, None, f'icutz{name}')  # the system has none either
         self.check_format(True, None, 'xicutz44l.dat')
+        self.check(['system', f'link {DATASETS}/2016g.1.0'], [], SWITCH, {FORMAT: None})
 
     def test_kind_of_file(self):
         for what in 'link icutzformat.txt', 'directory':
@@ -129,10 +130,12 @@ class IcuData(StartTest):
 
     def test_first_file_of_a_linked_directory(self):
         device.lay_out('system', '2016g.1.0')
-        device.put({f'{DATASETS}/icu/icutz{text}.dat': 'file' for text in ('46e', '44l', '47l')})
-        first = os.listdir(device.outside(f'{DATASETS}/icu'))[0]
+        icu = f'{DATASETS}/icu'
+        for number in range(30, 60):
+            device.put({f'{icu}/icutz{number}e.dat': 'file', f'{icu}/{number}/icutz9e.dat': 'file'})
+        first = next(name for name in os.listdir(device.outside(icu)) if 'icutz' in name)
         device.put({f'{DATASETS}/2016g.1.0/icutz': 'link ../icu', FORMAT: f'file {first[5:8]}'})
-        os.utime(device.outside(f'{DATASETS}/icu'), (2**31, 2**31))  # past a 32-bit long
+        os.utime(device.outside(icu), (2**31, 2**31))  # past a 32-bit long
         device.check_start([], SWITCH)
 
 
@@ -152,9 +155,8 @@ class LocalTime(StartTest):
             correcting = f'Correcting localtime link to {ZONEINFO}{rest}'
             self.check(['system', None, f'link {READ_ONLY}{rest}'], [correcting, ZONE_RESET],
                        DEFAULT_ZONE, {f'{SYSTEM_ZONEINFO}/Gone': 'link nowhere'})
-        for text in ('zoneinfo/Asia/Tokyo', '../zoneinfo/Asia/Tokyo', f'{TZ}/zoneinf',
-                     f'/x{READ_ONLY}/Asia/Tokyo', f'/x{ZONEINFO}/Asia/Tokyo',
-                     '/usr/share/zoneinfX/Asia/Tokyo', f'{SYSTEM_ZONEINFO[1:]}/Asia/Tokyo'):
+        for text in ('zoneinfo/x', '../zoneinfo/x', f'{TZ}/zoneinf', '/usr/share/zoneinfX/x',
+                     f'/x{READ_ONLY}/x', f'/x{ZONEINFO}/x', f'{SYSTEM_ZONEINFO[1:]}/x'):
             self.check(['system', None, f'link {text}'], [ZONE_RESET], DEFAULT_ZONE)
         self.check(['system', None, None], [ZONE_RESET], DEFAULT_ZONE)
         no_link = f'read_symlink: {LOCALTIME}: Invalid argument'
@@ -223,14 +225,13 @@ class Traces(StartTest):
             self.assertTrue(self.calls(rf'.*"{MARKER}", O_RDWR\|O_CREAT(\|O_L\w+)?, 0666', process))
 
     def test_failed_call(self):
-        zone, error = f'{ZONEINFO}/Asia/Tokyo', 'Input/output error'
+        zone = f'{ZONEINFO}/Asia/Tokyo'
         self.check(['system', None, f'link {READ_ONLY}/Asia/Tokyo'],
                    [f'Correcting localtime link to {zone}',
-                    f'create_symlink: from {LOCALTIME} to {zone}: {error}', ZONE_RESET],
+                    f'create_symlink: from {LOCALTIME} to {zone}: Input/output error', ZONE_RESET],
                    DEFAULT_ZONE, before=disturb('symlink', LOCALTIME, 'error=EIO:when=1'))
 
-    def test_power_cut(self):
-        # The manual's CAVEATS list what is lost.
+    def test_power_cut_as_in_caveats(self):
         changes = switch('2016f.1.1', '2016g.1.0') | {MARKER: 'file', LOCALTIME: f'link {ZONEINFO}'}
         for call, path, lost in (
                 ('symlink', ZONEINFO, [MARKER, RECORD]), ('unlink', ICU, [ICU, MARKER, RECORD]),
@@ -238,13 +239,13 @@ class Traces(StartTest):
                 ('write', RECORD, [RECORD]), ('symlink', LOCALTIME, [LOCALTIME])):
             with self.subTest(f'before {call} {path}'):
                 device.lay_out('2016f.1.1', '2016g.1.0', f'link {READ_ONLY}')
-                killed = device.start(*disturb(call, path, 'signal=KILL'))
-                self.assertIn(killed.returncode, [-9, 137])
+                process = device.start(*disturb(call, path, 'signal=KILL'))
+                self.assertIn(process.returncode, [-9, 137])
                 seen = device.snapshot()  # with a marker, which a start deletes
                 device.start()
                 seen |= device.snapshot()
-                self.assertCountEqual(lost, [path for path in changes
-                                             if seen.get(path) != changes[path]])
+                missing = [path for path in changes if seen.get(path) != changes[path]]
+                self.assertCountEqual(missing, lost)
 
 
 if __name__ == '__main__':
