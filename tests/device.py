@@ -10,7 +10,7 @@ import subprocess
 import sys
 import unittest
 
-unittest.TestCase.maxDiff = None  # whole
+unittest.TestCase.maxDiff = None
 
 SYSTEM_ZONEINFO = '/usr/share/zoneinfo.default'
 SYSTEM_ICU = '/usr/share/icu'
@@ -29,7 +29,7 @@ INCOMPATIBLE = 'Symlink points at data incompatible with installed system'
 NOT_TAKEN = 'New update not compatible or older version'
 NO_DATA = 'Unable to locate data; resetting to system partition'
 ZONE_RESET = 'localtime link invalid; resetting to America/Los_Angeles'
-ERROR = re.compile(r': [A-Z][^:\n]*\Z')  # with which every warning ends
+ERROR = re.compile(r': [A-Z][^:\n]*\Z')  # ends every warning
 
 KINDS = {0o100644: 'file', 0o120777: 'link', 0o40755: 'directory'}
 ENVIRONMENT = {'PATH': os.environ.get('PATH', os.defpath) + ':/usr/sbin'}
@@ -83,7 +83,7 @@ class Device:
             if subprocess.run(enter, env=ENVIRONMENT, capture_output=True).returncode == 0:
                 break
         else:
-            sys.exit('a device is entered by chroot, which takes root, a user namespace or sudo')
+            sys.exit('entering a device takes root, a user namespace or sudo')
         if b'__asan_init' in self.lock.read():  # AddressSanitizer reads /proc
             os.mkdir(f'{self.place}/proc')
             mount = 'mount --rbind /proc "$0/proc" && exec "$@"'
@@ -91,7 +91,7 @@ class Device:
         return ['env', *way], ['chroot', *options, self.place]
 
     def outside(self, path):
-        """Returns where a path is outside. A link on the way, which may lead out, is an error."""
+        """Returns where a path is outside; fails for a link on the way, which may lead out."""
         parent, name = os.path.split(self.place + path)
         if os.path.realpath(parent) != parent or name == '..' or path[0] != '/':
             raise ValueError(f'{path} may lead out of the device')
@@ -111,7 +111,7 @@ class Device:
                 pathlib.Path(path).write_bytes(os.fsencode(content))
 
     def snapshot(self):
-        """Returns the tree without the programs. An unusual mode takes the place of a kind."""
+        """Returns the tree without the programs. An unusual mode stands for its kind."""
         tree = {}
         for path in pathlib.Path(self.place).rglob('*'):
             name = str(path).removeprefix(self.place)
@@ -142,7 +142,7 @@ class Device:
                 self.put({path: f'link {SYSTEM_ZONEINFO}' if what == 'system' else what})
 
     def start(self, *before, arguments=(), stderr=subprocess.PIPE):
-        """Starts the program behind these words, and returns the process when it has ended."""
+        """Starts the program behind these words; returns the process, which has ended."""
         command = [*self.before_chroot, *before, *self.chroot, *self.command, *arguments]
         return subprocess.run(command, env=ENVIRONMENT, stdin=subprocess.DEVNULL,
                               stdout=subprocess.PIPE, stderr=stderr, timeout=20)

@@ -1,7 +1,7 @@
 #!/usr/bin/env -S python3 -EsB
 """Tests what starts of the program do to a device, which is made beside the program.
 
-Usage: starts.py PROGRAM [OPTION...], with the options of unittest, such as -k WORD."""
+Usage: starts.py PROGRAM [OPTION...], with unittest's options, such as -k WORD."""
 
 import os
 import re
@@ -51,7 +51,7 @@ class Selection(StartTest):
             2017a.1.0   2016h.1.0   system    file   -                   INCOMPATIBLE NOT_TAKEN
             2017a.1.0   2017b.1.0   system    file   -                   INCOMPATIBLE NOT_TAKEN
             2016g.1.0   2147483648a system    none   -                   NO_DATA'''
-        earlier = {MARKER: 'directory', '/var/db/icu': 'directory', RECORD: 'file of a longer one'}
+        earlier = {MARKER: 'directory', '/var/db/icu': 'directory', RECORD: 'file with more bytes'}
         for row in table.strip().splitlines()[1:]:
             current, latest, then, marker, record, *warnings = row.split()
             changes = {MARKER: None if marker == 'none' else marker, '/var/db/icu': None}
@@ -117,7 +117,7 @@ class IcuData(StartTest):
         self.check_format(False, 'file junk', 'icutz44x.dat')
         for name in '''44L.dat 44x.dat l.dat 44.dat 44l.dat.bak 44l.DAT 44lxdat :l.dat 4\udcb2l.dat
                 44l 44le.dat /l.dat /icutz44l.dat'''.split():
-            self.check_format(True, None, f'icutz{name}')  # the system has none either
+            self.check_format(True, None, f'icutz{name}')  # none, like the system
         self.check_format(True, None, 'xicutz44l.dat')
         self.check(['system', f'link {DATASETS}/2016g.1.0'], [], SWITCH, {FORMAT: None})
 
@@ -241,7 +241,7 @@ class Traces(StartTest):
                 device.lay_out('2016f.1.1', '2016g.1.0', f'link {READ_ONLY}')
                 process = device.start(*disturb(call, path, 'signal=KILL'))
                 self.assertIn(process.returncode, [-9, 137])
-                seen = device.snapshot()  # with a marker, which a start deletes
+                seen = device.snapshot()  # the next start deletes a marker
                 device.start()
                 seen |= device.snapshot()
                 missing = [path for path in changes if seen.get(path) != changes[path]]
