@@ -33,7 +33,7 @@ ERROR = re.compile(r': [A-Z][^:\n]*\Z')  # ends every warning
 
 KINDS = {0o100644: 'file', 0o120777: 'link', 0o40755: 'directory'}
 ENVIRONMENT = {'PATH': os.environ.get('PATH', os.defpath) + ':/usr/sbin'}
-for name in 'DEBUG HOME ICU_DATA ICU_TIMEZONE_FILES_DIR LANG LC_ALL TZ TZDIR'.split():
+for name in 'DEBUG HOME ICU_DATA LANG LC_ALL TZ TZDIR'.split():
     ENVIRONMENT[name] = '/elsewhere'
 
 
@@ -56,9 +56,8 @@ class Device:
 
     def __init__(self, directory, name, command, tools=()):
         """Makes the device anew, with the tools and the program, the end of the command, before
-        which an emulator may stand. Waits for another run with the same program."""
-        self.lock = open(command[-1], 'rb')
-        fcntl.flock(self.lock, fcntl.LOCK_EX)
+        which an emulator may stand. Waits for a run with the same program."""
+        fcntl.flock(os.open(command[-1], os.O_RDONLY), fcntl.LOCK_EX)
         os.umask(0o022)
         self.place = f'{os.path.realpath(directory)}/{name}'
         mounts = pathlib.Path('/proc/self/mountinfo').read_text('unicode_escape')
@@ -72,8 +71,8 @@ class Device:
                 shutil.copy(path if path in ldd else program, self.place + path)
         self.command = [f'/{os.path.basename(word)}' for word in command]
         self.before_chroot, self.chroot = self.way_in()
-        self.fixed = {}
-        self.fixed = self.snapshot()
+        self.fixed = set()
+        self.fixed = {self.place + path for path in self.snapshot()}
 
     def way_in(self):
         """Returns the words before a command that calls chroot, and those that call it."""
@@ -84,14 +83,15 @@ class Device:
                 break
         else:
             sys.exit('entering a device takes root, a user namespace or sudo')
-        if b'__asan_init' in self.lock.read():  # AddressSanitizer reads /proc
+        program = pathlib.Path(f'{self.place}/mira_tzlinks').read_bytes()
+        if b'__asan_init' in program:  # AddressSanitizer reads /proc
             os.mkdir(f'{self.place}/proc')
             mount = 'mount --rbind /proc "$0/proc" && exec "$@"'
             way += ['unshare', '--mount', 'sh', '-c', mount, self.place]
         return ['env', *way], ['chroot', *options, self.place]
 
     def outside(self, path):
-        """Returns where a path is outside; fails for a link on the way, which may lead out."""
+        """Returns where a path is outside; fails for a link on the way."""
         parent, name = os.path.split(self.place + path)
         if os.path.realpath(parent) != parent or name == '..' or path[0] != '/':
             raise ValueError(f'{path} may lead out of the device')
@@ -113,15 +113,15 @@ class Device:
     def snapshot(self):
         """Returns the tree without the programs. An unusual mode stands for its kind."""
         tree = {}
-        for path in pathlib.Path(self.place).rglob('*'):
-            name = str(path).removeprefix(self.place)
-            if name not in self.fixed:
-                mode = path.lstat().st_mode
-                tree[name] = KINDS.get(mode, oct(mode))
-                if path.is_symlink():
-                    tree[name] += f' {os.readlink(path)}'
-                elif path.is_file() and path.stat().st_size:
-                    tree[name] += ' ' + os.fsdecode(path.read_bytes())
+        for parent, directories, files in os.walk(self.place):
+            for path in {f'{parent}/{name}' for name in directories + files} - self.fixed:
+                mode = os.lstat(path).st_mode
+                what = KINDS.get(mode, oct(mode))
+                if os.path.islink(path):
+                    what += f' {os.readlink(path)}'
+                elif os.path.isfile(path) and os.path.getsize(path):
+                    what += ' ' + os.fsdecode(pathlib.Path(path).read_bytes())
+                tree[path.removeprefix(self.place)] = what
         return tree
 
     def lay_out(self, current='system', latest=None, localtime=f'link {ZONEINFO}/Asia/Tokyo'):

@@ -29,7 +29,7 @@ def unparsed(version):
 
 class StartTest(unittest.TestCase):
     def check(self, links, warnings=(), changes={}, besides={}, **options):
-        """Checks a start of a device with these links and, besides, this tree."""
+        """Checks a start of a device with these links and this tree."""
         with self.subTest(f'{links} {besides}'[:300]):
             device.lay_out(*links)
             device.put(besides)
@@ -84,7 +84,7 @@ class Versions(StartTest):
 
     def test_refused(self):
         texts = '''2014 a a2014 2014A 2014aA 2014a. 2014a.b 2014a.1b 2014a.1. 2014a1 2014a.1.0.2
-            2014a+1 2014` 2014{ 201/a 201:a 2014a./ 2014a.1.: 2014a/ 2014a..1 2014\udce9'''.split()
+            2014a+1 2014` 2014{ 201/a 201:a 2014a./ 2014a.: 2014a..1 2014\udce9'''.split()
         for text in [*texts, ' 2014a', '2014a ', '2014a\n', 70 * 'x']:
             self.check(['system', f'link {DATASETS}/{text}'], [*unparsed(text), NOT_TAKEN])
         for text, version in ('x/', 'x'), ('1a//b', '1a/'), ('1a/b/c', '1a/b'):
@@ -128,7 +128,7 @@ class IcuData(StartTest):
         os.chmod(device.outside(f'{DATASETS}/2016g.1.0/icutz/icutz44l.dat'), 0o773)
         device.check_start([NOT_TAKEN])
 
-    def test_first_file_of_a_linked_directory(self):
+    def test_first_file(self):
         device.lay_out('system', '2016g.1.0')
         icu = f'{DATASETS}/icu'
         for number in range(30, 60):
@@ -156,7 +156,7 @@ class LocalTime(StartTest):
             self.check(['system', None, f'link {READ_ONLY}{rest}'], [correcting, ZONE_RESET],
                        DEFAULT_ZONE, {f'{SYSTEM_ZONEINFO}/Gone': 'link nowhere'})
         for text in ('zoneinfo/x', '../zoneinfo/x', f'{TZ}/zoneinf', '/usr/share/zoneinfX/x',
-                     f'/x{READ_ONLY}/x', f'/x{ZONEINFO}/x', f'{SYSTEM_ZONEINFO[1:]}/x'):
+                     f'/x{READ_ONLY}/x', f'/x{ZONEINFO}/x'):
             self.check(['system', None, f'link {text}'], [ZONE_RESET], DEFAULT_ZONE)
         self.check(['system', None, None], [ZONE_RESET], DEFAULT_ZONE)
         no_link = f'read_symlink: {LOCALTIME}: Invalid argument'
@@ -205,7 +205,7 @@ def disturb(call, path, how):
 @unittest.skipIf(';' in ''.join(sys.argv[1:2]), "an emulator's calls are not the program's")
 class Traces(StartTest):
     def calls(self, pattern, process):
-        """Returns the program's calls that match, after a check that it closes what it opens."""
+        """Returns the program's calls that match; checks that it closes what it opens."""
         text = re.search(rf'(?ms)^\w+\([^\n]*"{TZ}/".*', os.fsdecode(process.stdout))[0]
         opened = re.findall(r'(?m)^open.* = \d+(</.*>)$', text)
         self.assertCountEqual(opened, re.findall(r'(?m)^close\(\d+(</.*>)\) += 0$', text))
@@ -213,7 +213,7 @@ class Traces(StartTest):
 
     def test_quiet_start(self):
         process = self.check([], before=STRACE)
-        self.assertEqual(self.calls(r'\w+\([^"]*"(/(?:usr/share|var)/[^"]*)"', process),
+        self.assertEqual(self.calls(r'\w+\([^"]*"(/(?:usr|var)/[^"]*)"', process),
                          [f'{TZ}/', f'{TZ}/tz/', MARKER, '/var/db/icu', VERSION, FORMAT, LATEST,
                           ZONEINFO, VERSION, FORMAT, LOCALTIME])
         self.assertEqual(len(self.calls(r'fcntl.*, 0x40.*, 0x4\)', process)), 2)
