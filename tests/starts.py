@@ -1,5 +1,5 @@
 #!/usr/bin/env -S python3 -EsB
-"""Tests what starts of the program do to a device, which is made beside the program.
+"""Tests what starts of the program do to a device beside it.
 
 Usage: starts.py PROGRAM [OPTION...], with unittest's options, such as -k WORD."""
 
