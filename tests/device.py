@@ -55,8 +55,8 @@ class Device:
     content, a "link" with its text, or None."""
 
     def __init__(self, directory, name, command, tools=()):
-        """Makes the device anew, with the tools and the program, the end of the command, before
-        which an emulator may stand. Waits for a run with the same program."""
+        """Makes the device anew, with the tools and the command: the program, behind an emulator
+        if any. Waits while another run has the program."""
         fcntl.flock(os.open(command[-1], os.O_RDONLY), fcntl.LOCK_EX)
         os.umask(0o022)
         self.place = f'{os.path.realpath(directory)}/{name}'
@@ -125,8 +125,8 @@ class Device:
         return tree
 
     def lay_out(self, current='system', latest=None, localtime=f'link {ZONEINFO}/Asia/Tokyo'):
-        """Makes the device anew; the system has version 2016f and ICU format 44l. A link to data is
-        "system", the version of an update (with another format if of 2017), or as in a tree."""
+        """Makes the device anew; the system has version 2016f and ICU format 44l. A data link is
+        "system", the version of an update (another format in 2017), or as in a tree."""
         self.put({'/usr/share': None, '/var': None, DATASETS: 'directory', ICU: 'link ./stale',
                   f'{SYSTEM_ZONEINFO}/+VERSION': 'file 2016f\n', LOCALTIME: localtime,
                   f'{SYSTEM_ZONEINFO}/Asia/Tokyo': 'file', f'{SYSTEM_ICU}/icutz77e.dat': 'file',
@@ -148,8 +148,8 @@ class Device:
                               stdout=subprocess.PIPE, stderr=stderr, timeout=20)
 
     def check_start(self, warnings=(), changes={}, status=0, before=(), **options):
-        """Starts the program and returns the process. Fails, and shows why, unless it writes these
-        warnings, which may lack the error at the end, and changes the tree like this."""
+        """Starts the program. Fails, and shows why, unless it writes these warnings, which may
+        lack the error at the end, and makes these changes. Returns the process."""
         old = self.snapshot()
         process = self.start(*before, **options)
         new = self.snapshot()

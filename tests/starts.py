@@ -17,8 +17,7 @@ VERSION, FORMAT = f'{SYSTEM_ZONEINFO}/+VERSION', f'{SYSTEM_ICU}/icutzformat.txt'
 SYSTEM, SWITCH = links_to('system'), switch('2016f.1.0', '2016g.1.0')
 
 BUSY = ['2016e.1.0', '2016g.1.0', f'link {READ_ONLY}/No/Zone']
-BUSY_WARNINGS = [INCOMPATIBLE, f'Correcting localtime link to {ZONEINFO}/No/Zone',
-                 f'{ZONE_RESET}: No such file or directory']
+BUSY_WARNINGS = [INCOMPATIBLE, f'Correcting localtime link to {ZONEINFO}/No/Zone', ZONE_RESET]
 BUSY_CHANGES = SWITCH | DEFAULT_ZONE | {MARKER: 'file'}
 
 
@@ -44,14 +43,15 @@ class Selection(StartTest):
             system      2016g.1.0   2016g.1.0 none   2016f.1.0_2016g.1.0
             system      2016f.1.0   system    none   -                   NOT_TAKEN
             system      2017a.1.0   system    none   -                   NOT_TAKEN
-            2016g.1.0   none        2016g.1.0 none   -
+            2016g.1.0   2016g.1.0   2016g.1.0 none   -                   NOT_TAKEN
             2016f.1.0   2016g.1.0   2016g.1.0 file   2016f.1.0_2016g.1.0
             2016e.1.0   none        system    file   -                   INCOMPATIBLE
             2016d.1.0   2016e.1.0   2016e.1.0 file   2016f.1.0_2016e.1.0 INCOMPATIBLE
             2017a.1.0   2016h.1.0   system    file   -                   INCOMPATIBLE NOT_TAKEN
             2017a.1.0   2017b.1.0   system    file   -                   INCOMPATIBLE NOT_TAKEN
-            2016g.1.0   2147483648a system    none   -                   NO_DATA'''
-        earlier = {MARKER: 'directory', '/var/db/icu': 'directory', RECORD: 'file with more bytes'}
+            2147483648a none        system    none   -                   NO_DATA
+            2016g.1.0   2016h.1.9876543210 system none -                 NO_DATA'''
+        earlier = {MARKER: 'directory', '/var/db/icu': 'directory', RECORD: 'file and more bytes'}
         for row in table.strip().splitlines()[1:]:
             current, latest, then, marker, record, *warnings = row.split()
             changes = {MARKER: None if marker == 'none' else marker, '/var/db/icu': None}
@@ -68,7 +68,7 @@ class Selection(StartTest):
                      '/' + 2000 * 'x'):
             bad_path = f'mira_dataset::create_components: bad path {text[:1024]}'
             self.check(['2016g.1.0', f'link {text}'], [bad_path, NO_DATA], SYSTEM)
-        self.check(['file'], [f'read_symlink: {ZONEINFO}: Invalid argument', BAD_LINKS], SYSTEM)
+        self.check(['file'], [f'read_symlink: {ZONEINFO}', BAD_LINKS], SYSTEM)
         self.check(['2016g.1.0', 'file'], [f'read_symlink: {LATEST}', NO_DATA], SYSTEM)
         self.check([None, '2016g.1.0'], ['Bad zoneinfo link ', BAD_LINKS], SWITCH)
 
@@ -76,16 +76,16 @@ class Selection(StartTest):
 class Versions(StartTest):
     def test_order(self):
         texts = '''0a 2014a 2014a.0 2014a.1 2014a.1.0 2014a.1.9 2014a.1.10 2014a.2 2014a.9.9
-            02014a.010 2014aa 2014az.7 2014b 2014z.9 2015a 10000a 2147483647a'''.split()
+            02014a.010 2014a.999 2014aa 2014az.7 2014b 2014z.9 2015a 10000a 2147483647a'''.split()
         unset, warnings = {VERSION: None}, unparsed('.1.0')  # older than all
         for old, new in zip(texts, texts[1:]):
             self.check([old, new], warnings, switch(old, new) | {MARKER: 'file'}, unset)
             self.check([new, old], [*warnings, NOT_TAKEN], {}, unset)
 
     def test_refused(self):
-        texts = '''2014 a a2014 2014A 2014aA 2014a. 2014a.b 2014a.1b 2014a.1. 2014a1 2014a.1.0.2
-            2014a+1 2014` 2014{ 201/a 201:a 2014a./ 2014a.: 2014a..1 2014\udce9'''.split()
-        for text in [*texts, ' 2014a', '2014a ', '2014a\n', 70 * 'x']:
+        texts = '''2014 a a2014 2014A 2014a. 2014a.b 2014a.1b 2014a.1. 2014a1 2014a.1.0.2
+            +2014a 2014a.-1 2014a,1 2014a.1-1 2014` 2014{ 201/a 201:a 2014\udce9'''.split()
+        for text in [*texts, ' 2014a', '2014a ', '2014a\n', f'2014{70 * "a"}.']:
             self.check(['system', f'link {DATASETS}/{text}'], [*unparsed(text), NOT_TAKEN])
         for text, version in ('x/', 'x'), ('1a//b', '1a/'), ('1a/b/c', '1a/b'):
             self.check([f'link {DATASETS}/{text}'], [*unparsed(version), INCOMPATIBLE],
@@ -117,7 +117,7 @@ class IcuData(StartTest):
         self.check_format(False, 'file junk', 'icutz44x.dat')
         for name in '''44L.dat 44x.dat l.dat 44.dat 44l.dat.bak 44l.DAT 44lxdat :l.dat 4\udcb2l.dat
                 44l 44le.dat /l.dat /icutz44l.dat'''.split():
-            self.check_format(True, None, f'icutz{name}')  # none, like the system
+            self.check_format(True, None, f'icutz{name}')  # none, as the system
         self.check_format(True, None, 'xicutz44l.dat')
         self.check(['system', f'link {DATASETS}/2016g.1.0'], [], SWITCH, {FORMAT: None})
 
@@ -151,16 +151,16 @@ class LocalTime(StartTest):
                        {LOCALTIME: f'link {ZONEINFO}{rest}'})
 
     def test_reset(self):
-        for rest in '.default/Asia/Tokyo', '/posix/Asia/Tokyo', '/Asia/Tokyo/', '/Gone':
+        for rest in '.default/Asia/Tokyo', '/posix', '/Asia/Tokyo/', '/Gone':
             correcting = f'Correcting localtime link to {ZONEINFO}{rest}'
             self.check(['system', None, f'link {READ_ONLY}{rest}'], [correcting, ZONE_RESET],
                        DEFAULT_ZONE, {f'{SYSTEM_ZONEINFO}/Gone': 'link nowhere'})
         for text in ('zoneinfo/x', '../zoneinfo/x', f'{TZ}/zoneinf', '/usr/share/zoneinfX/x',
-                     f'/x{READ_ONLY}/x', f'/x{ZONEINFO}/x'):
+                     f'/x{READ_ONLY}/x', f'/x{ZONEINFO}', f'{DATASETS}/1a/x'):
             self.check(['system', None, f'link {text}'], [ZONE_RESET], DEFAULT_ZONE)
         self.check(['system', None, None], [ZONE_RESET], DEFAULT_ZONE)
-        no_link = f'read_symlink: {LOCALTIME}: Invalid argument'
-        self.check(['system', None, 'directory'], [no_link, ZONE_RESET], DEFAULT_ZONE)
+        warnings = [f'read_symlink: {LOCALTIME}', f'{ZONE_RESET}: Invalid argument']
+        self.check(['system', None, 'directory'], warnings, DEFAULT_ZONE)
 
 
 class Failures(StartTest):
@@ -202,7 +202,7 @@ def disturb(call, path, how):
     return [*STRACE, '-P', path, '-P', device.place + path, f'-einject=/{call}:{how}']
 
 
-@unittest.skipIf(';' in ''.join(sys.argv[1:2]), "an emulator's calls are not the program's")
+@unittest.skipIf(';' in ''.join(sys.argv[1:2]), "strace would trace the emulator")
 class Traces(StartTest):
     def calls(self, pattern, process):
         """Returns the program's calls that match; checks that it closes what it opens."""
