@@ -231,7 +231,7 @@ class Traces(StartTest):
                     f'create_symlink: from {LOCALTIME} to {zone}: Input/output error', ZONE_RESET],
                    DEFAULT_ZONE, before=disturb('symlink', LOCALTIME, 'error=EIO:when=1'))
 
-    def test_power_cut_as_in_caveats(self):
+    def test_caveats(self):
         changes = switch('2016f.1.1', '2016g.1.0') | {MARKER: 'file', LOCALTIME: f'link {ZONEINFO}'}
         for call, path, lost in (
                 ('symlink', ZONEINFO, [MARKER, RECORD]), ('unlink', ICU, [ICU, MARKER, RECORD]),
