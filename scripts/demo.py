@@ -82,7 +82,7 @@ start('3. Nothing is new.', [NOT_TAKEN], note='''\
 (Every ordinary start after an update looks like this and prints this warning.)''')
 
 device.put({f'{SYSTEM_ZONEINFO}/+VERSION': f'file {year}b\n'})
-start(f'4. The system partition was upgraded to {year}b, past the update, without that summer time.',
+start(f'4. The system partition was upgraded to {year}b, past the update, without summer time.',
       [INCOMPATIBLE, NOT_TAKEN], links_to('system') | {MARKER: 'file'}, '2025-01-15 04:00 -0800')
 
 device.put({LATEST: None, update: None, LOCALTIME: 'link /usr/share/zoneinfo/Asia/Tokyo'})
@@ -94,8 +94,6 @@ start('5. Another program cleaned up the update, and linked local time past the 
 device.put({LOCALTIME: 'link /no/such/zone'})
 start('6. The local-time link was broken.', [ZONE_RESET], DEFAULT_ZONE, '2025-01-15 04:00 -0800')
 
-for path in device.snapshot():
-    os.utime(device.outside(path), follow_symlinks=False)  # the dates of today
 program = ' '.join([*device.before_chroot[1:], 'chroot build/demo'])
 print(f'''
 Look at the device, change something, and start the program by hand, from the project's directory:
