@@ -33,8 +33,7 @@ ERROR = re.compile(r': [A-Z][^:\n]*\Z')  # ends every warning
 
 KINDS = {0o100644: 'file', 0o120777: 'link', 0o40755: 'directory'}
 ENVIRONMENT = {'PATH': os.environ.get('PATH', os.defpath) + ':/usr/sbin'}
-for name in 'DEBUG HOME ICU_DATA LANG LC_ALL TZ TZDIR'.split():
-    ENVIRONMENT[name] = '/elsewhere'
+ENVIRONMENT |= dict.fromkeys('DEBUG HOME ICU_DATA LANG LC_ALL TZ TZDIR'.split(), '/elsewhere')
 
 
 def links_to(version):
@@ -46,7 +45,7 @@ def links_to(version):
 
 
 def switch(before, after):
-    """Returns what a switch changes: the data links, and the record of both versions."""
+    """Returns what a switch changes: the data links and the record."""
     return links_to(after) | {RECORD: f'file {before}_{after}'}
 
 
@@ -142,7 +141,7 @@ class Device:
                 self.put({path: f'link {SYSTEM_ZONEINFO}' if what == 'system' else what})
 
     def start(self, *before, arguments=(), stderr=subprocess.PIPE):
-        """Starts the program behind these words; returns the process, which has ended."""
+        """Starts the program behind these words; returns the ended process."""
         command = [*self.before_chroot, *before, *self.chroot, *self.command, *arguments]
         return subprocess.run(command, env=ENVIRONMENT, stdin=subprocess.DEVNULL,
                               stdout=subprocess.PIPE, stderr=stderr, timeout=20)
