@@ -50,7 +50,7 @@ class Selection(StartTest):
             2017a.1.0   2016h.1.0   system    file   -                   INCOMPATIBLE NOT_TAKEN
             2017a.1.0   2017b.1.0   system    file   -                   INCOMPATIBLE NOT_TAKEN
             2016g.9876543210 none   system    none   -                   NO_DATA'''
-        earlier = {MARKER: 'directory', '/var/db/icu': 'directory', RECORD: 'file and more bytes'}
+        earlier = {MARKER: 'directory', '/var/db/icu': 'directory', RECORD: 'file with more'}
         for row in table.strip().splitlines()[1:]:
             current, latest, then, marker, record, *warnings = row.split()
             changes = {MARKER: None if marker == 'none' else marker, '/var/db/icu': None}
