@@ -200,7 +200,7 @@ STRACE = 'strace -y --quiet=all -E ASAN_OPTIONS=detect_leaks=0 -o /dev/stdout'.s
 
 
 def disturb(call, path, how):
-    return [*STRACE, '-P', path, '-P', device.place + path, f'-einject=/{call}:{how}']
+    return [*STRACE, '-P', path, f'-einject=/{call}:{how}']
 
 
 @unittest.skipIf(';' in ''.join(sys.argv[1:2]), "strace would trace the emulator")
@@ -222,7 +222,7 @@ class Traces(StartTest):
     def test_busy_start(self):
         for words in [], ['-n'], ['-h'], ['--version'], ['/x', 'y']:
             process = self.check(BUSY, BUSY_WARNINGS, BUSY_CHANGES, before=STRACE, arguments=words)
-            self.assertEqual(len(self.calls('write', process)), len([RECORD, *BUSY_WARNINGS]))
+            self.assertEqual(len(self.calls(r'write\([12]\b', process)), len(BUSY_WARNINGS))
             self.assertTrue(self.calls(rf'.*"{MARKER}", O_RDWR\|O_CREAT(\|O_L\w+)?, 0666', process))
 
     def test_failed_call(self):
@@ -237,7 +237,7 @@ class Traces(StartTest):
         for call, path, lost in (
                 ('symlink', ZONEINFO, [MARKER, RECORD]), ('unlink', ICU, [ICU, MARKER, RECORD]),
                 ('symlink', ICU, [ICU, MARKER, RECORD]), ('open', MARKER, [MARKER, RECORD]),
-                ('write', RECORD, [RECORD]), ('symlink', LOCALTIME, [LOCALTIME])):
+                ('open', RECORD, [RECORD]), ('symlink', LOCALTIME, [LOCALTIME])):
             with self.subTest(f'before {call} {path}'):
                 device.lay_out('2016f.1.1', '2016g.1.0', f'link {READ_ONLY}')
                 process = device.start(*disturb(call, path, 'signal=KILL'))
