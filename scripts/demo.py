@@ -90,10 +90,10 @@ start('5. Another program cleaned up the update, and linked local time past the 
 device.put({LOCALTIME: 'link /no/such/zone'})
 start('6. The local-time link was broken.', [ZONE_RESET], DEFAULT_ZONE, '2025-01-15 04:00 -0800')
 
-program = ' '.join([*device.before_chroot[1:], 'chroot build/demo'])
+program = ' '.join([*device.before_chroot[1:], *device.chroot[:-1], 'build/demo'])
 print(f'''
 Look at the device, change something, and start the program by hand, from the project's directory:
     ln -sfn /usr/share/zoneinfo/Asia/Tokyo build/demo{LOCALTIME}
     {program} /mira_tzlinks
     ls -l build/demo/var/db/timezone
-Read next: the diagram in README.md of what a start decides, and doc/mira_tzlinks.8, the manual''')
+Read next: the diagram in README.md, and doc/mira_tzlinks.8, the manual''')

@@ -55,19 +55,21 @@ class Device:
 
     def __init__(self, directory, name, command, tools=()):
         """Makes the device anew, with the tools and the command: the program, behind an emulator
-        if any. Waits while another run has the program."""
+        if any. Locks the program until the process ends."""
         fcntl.flock(os.open(command[-1], os.O_RDONLY), fcntl.LOCK_EX)
         os.umask(0o022)
         self.place = f'{os.path.realpath(directory)}/{name}'
+        ours = os.path.isfile(f'{self.place}/mira_tzlinks') or not os.path.lexists(self.place)
         mounts = pathlib.Path('/proc/self/mountinfo').read_text('unicode_escape')
-        if os.fsencode(self.place).decode('latin1') in mounts:
-            sys.exit(f'{self.place} is not removed: something is mounted in it')
+        if not ours or os.fsencode(self.place).decode('latin1') in mounts:
+            sys.exit(f'{self.place} is kept: no device, or something is mounted in it')
         subprocess.run(['rm', '-rf', '--one-file-system', '--', self.place], check=True)
         for program in map(shutil.which, [*command, *tools]):
             ldd = subprocess.run(['ldd', program], capture_output=True, text=True).stdout
-            for path in [f'/{os.path.basename(program)}', *re.findall(r'(/\S+) \(0x', ldd)]:
+            libraries = re.findall(r'(/\S+) \(0x', ldd)
+            for path in [f'/{os.path.basename(program)}', *libraries]:
                 os.makedirs(os.path.dirname(self.place + path), exist_ok=True)
-                shutil.copy(path if path in ldd else program, self.place + path)
+                shutil.copy(path if path in libraries else program, self.place + path)
         self.command = [f'/{os.path.basename(word)}' for word in command]
         self.before_chroot, self.chroot = self.way_in()
         self.fixed = set()
@@ -82,15 +84,14 @@ class Device:
                 break
         else:
             sys.exit('entering a device takes root, a user namespace or sudo')
-        program = pathlib.Path(f'{self.place}/mira_tzlinks').read_bytes()
-        if b'__asan_init' in program:  # AddressSanitizer reads /proc
-            os.mkdir(f'{self.place}/proc')
+        if b'__asan_init' in pathlib.Path(f'{self.place}/mira_tzlinks').read_bytes():
+            os.mkdir(f'{self.place}/proc')  # which AddressSanitizer reads
             mount = 'mount --rbind /proc "$0/proc" && exec "$@"'
             way += ['unshare', '--mount', 'sh', '-c', mount, self.place]
         return ['env', *way], ['chroot', *options, self.place]
 
     def outside(self, path):
-        """Returns where a path is outside; fails for a link on the way."""
+        """Returns where a path is outside; fails for a link before its last name."""
         parent, name = os.path.split(self.place + path)
         if os.path.realpath(parent) != parent or name == '..' or path[0] != '/':
             raise ValueError(f'{path} may lead out of the device')
@@ -103,6 +104,7 @@ class Device:
             shutil.rmtree(path, ignore_errors=True)
             pathlib.Path(path).unlink(missing_ok=True)
             kind, _, content = (what or '').partition(' ')
+            assert kind in ('', *KINDS.values()), what
             os.makedirs(path if kind == 'directory' else os.path.dirname(path), exist_ok=True)
             if kind == 'link':
                 os.symlink(content, path)
@@ -124,8 +126,8 @@ class Device:
         return tree
 
     def lay_out(self, current='system', latest=None, localtime=f'link {ZONEINFO}/Asia/Tokyo'):
-        """Makes the device anew; the system has version 2016f and ICU format 44l. A data link is
-        "system", the version of an update (another format in 2017), or as in a tree."""
+        """Makes /usr/share and /var anew; the system has version 2016f, ICU format 44l. A link is
+        "system", the version of an update (of 2017: another format), or as in a tree."""
         self.put({'/usr/share': None, '/var': None, DATASETS: 'directory', ICU: 'link ./stale',
                   f'{SYSTEM_ZONEINFO}/+VERSION': 'file 2016f\n', LOCALTIME: localtime,
                   f'{SYSTEM_ZONEINFO}/Asia/Tokyo': 'file', f'{SYSTEM_ICU}/icutz77e.dat': 'file',
