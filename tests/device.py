@@ -55,7 +55,7 @@ class Device:
 
     def __init__(self, directory, name, command, tools=()):
         """Makes the device anew, with the tools and the command: the program, behind an emulator
-        if any. Locks the program until the process ends."""
+        if any. Locks the program to the end."""
         fcntl.flock(os.open(command[-1], os.O_RDONLY), fcntl.LOCK_EX)
         os.umask(0o022)
         self.place = f'{os.path.realpath(directory)}/{name}'
@@ -64,7 +64,7 @@ class Device:
         if not ours or os.fsencode(self.place).decode('latin1') in mounts:
             sys.exit(f'{self.place} is kept: no device, or something is mounted in it')
         subprocess.run(['rm', '-rf', '--one-file-system', '--', self.place], check=True)
-        for program in map(shutil.which, [*command, *tools]):
+        for program in [command[-1], *map(shutil.which, [*command[:-1], *tools])]:
             ldd = subprocess.run(['ldd', program], capture_output=True, text=True).stdout
             libraries = re.findall(r'(/\S+) \(0x', ldd)
             for path in [f'/{os.path.basename(program)}', *libraries]:
@@ -112,7 +112,7 @@ class Device:
                 pathlib.Path(path).write_bytes(os.fsencode(content))
 
     def snapshot(self):
-        """Returns the tree without the programs. An unusual mode stands for its kind."""
+        """Returns the tree without programs. An odd mode stands for its kind."""
         tree = {}
         for parent, directories, files in os.walk(self.place):
             for path in {f'{parent}/{name}' for name in directories + files} - self.fixed:
