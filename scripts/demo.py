@@ -33,7 +33,6 @@ def start(title, warnings=(), changes={}, date=None, note=''):
         was, now = before.get(path, 'none'), after.get(path, 'none')
         change = f'was {was}\n{23 * " "}now ' if now != was else 4 * ' '
         print(f'   {path.rpartition("/")[2]:19} {change}{now}')
-    print('   as promised')
 
 
 def compile_tree(source, directory):
@@ -45,7 +44,7 @@ source = pathlib.Path('/usr/share/zoneinfo/tzdata.zi').read_text()
 first = (re.match('# version ([0-9]{4}[a-z]+)', source) or sys.exit('tzdata.zi has no version'))[1]
 year = int(first[:4]) + 1
 update = f'{DATASETS}/{year}a.1.0'
-# The zone's last line ends with 2024; another follows.
+# The zone's last line holds until 2025; another follows, without a change of the offset.
 invented = re.sub(r'(?m)^Z America/Los_Angeles .*(\n-?\d.*)*', r'\g<0> 2025\n-7 - PDT', source)
 
 device = Device('build', 'demo', ['build/release/mira_tzlinks'], ['date'])
@@ -73,12 +72,12 @@ device.put({LATEST: None, update: None, LOCALTIME: 'link /usr/share/zoneinfo/Asi
 start('5. Another program cleaned up the update, and linked local time past the zoneinfo link.',
       [f'Correcting localtime link to {ZONEINFO}/Asia/Tokyo'],
       {LOCALTIME: f'link {ZONEINFO}/Asia/Tokyo', MARKER: None}, '2025-01-15 21:00 +0900',
-      '(The device has no /usr/share/zoneinfo, so that its date was in UTC.)')
+      '(Each start first deletes the marker. Without /usr/share/zoneinfo, the date was in UTC.)')
 
 program = ' '.join([*device.before_chroot[1:], *device.chroot[:-1], 'build/demo'])
 print(f'''
-Look at the device, change something, and start the program by hand, from the project's directory:
+No start changed anything else. Try the program by hand, from the project's directory:
     ln -sfn /usr/share/zoneinfo/Asia/Tokyo build/demo{LOCALTIME}
-    {program} /mira_tzlinks
+    PATH=$PATH:/usr/sbin {program} /mira_tzlinks
     ls -l build/demo/var/db/timezone
 Read next: the diagram in README.md, and doc/mira_tzlinks.8, the manual''')
