@@ -1,5 +1,5 @@
-"""A device: a directory with the program in it. Only the program enters it, by chroot; the tests
-stay outside, and write into it through no link."""
+"""A device: a directory with the program in it, which starts there by chroot. Tests stay outside,
+and write into it through no link."""
 
 import fcntl
 import os

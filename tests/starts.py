@@ -16,8 +16,8 @@ READ_ONLY = '/usr/share/zoneinfo'
 VERSION, FORMAT = f'{SYSTEM_ZONEINFO}/+VERSION', f'{SYSTEM_ICU}/icutzformat.txt'
 SYSTEM, SWITCH = links_to('system'), switch('2016f.1.0', '2016g.1.0')
 
-BUSY = ['2016e.1.0', '2016g.1.0', f'link {READ_ONLY}/No/Zone']
-BUSY_WARNINGS = [INCOMPATIBLE, f'Correcting localtime link to {ZONEINFO}/No/Zone', ZONE_RESET]
+BUSY = ['2016e.1.0', '2016g.1.0', f'link {READ_ONLY}/Asia/Tokyo']
+BUSY_WARNINGS = [INCOMPATIBLE, f'Correcting localtime link to {ZONEINFO}/Asia/Tokyo', ZONE_RESET]
 BUSY_CHANGES = SWITCH | DEFAULT_ZONE | {MARKER: 'file'}
 
 
@@ -68,33 +68,32 @@ class Selection(StartTest):
             self.check(['2016g.1.0', f'link {text}'], [bad_path, NO_DATA], SYSTEM)
         self.check(['file'], [f'read_symlink: {ZONEINFO}', BAD_LINKS], SYSTEM)
         self.check(['2016g.1.0', 'file'], [f'read_symlink: {LATEST}', NO_DATA], SYSTEM)
-        self.check([None, '2016g.1.0'], ['Bad zoneinfo link ', BAD_LINKS], SWITCH)
 
 
 class Versions(StartTest):
     def test_order(self):
-        texts = '''0a 2014a 2014a.0 2014a.1 2014a.1.0 2014a.1.9 2014a.1.10 2014a.2 2014a.9.9
-            02014a.010 2014a.999 2014aa 2014az.7 2014b 2014z.9 2015a 10000a 2147483647a'''.split()
+        texts = '''0a 2014a 2014a.0 2014a.1 2014a.1.0 2014a.1.9 2014a.1.65536 2014a.9
+            02014a.010 2014a.65536 2014aa 2014az.7 2014b 2014z.9 2015a 10000a 2147483647a'''.split()
         unset, warnings = {VERSION: None}, unparsed('.1.0')  # older than all
         for old, new in zip(texts, texts[1:]):
             self.check([old, new], warnings, switch(old, new) | {MARKER: 'file'}, unset)
-            self.check([new, old], [*warnings, NOT_TAKEN], {}, unset)
+            self.check([new, old], [*warnings, NOT_TAKEN], {}, {VERSION: 'directory'})
 
     def test_refused(self):
         texts = '''2014 a a2014 2014A 2014a. 2014a.b 2014a.1b 2014a.1. 2014a1 2014a.1.0.2
             +2014a 2014a.-1 2014a,1 2014a.1-1 2014` 2014{ 201/a 201:a 2014\udce9'''.split()
-        for text in [*texts, ' 2014a', '2014a ', '2014a\n', f'2014{70 * "a"}.']:
+        for text in [*texts, ' 2014a', '2014a ', '2014a\n', f'2014{300 * "a"}.']:
             self.check(['system', f'link {DATASETS}/{text}'], [*unparsed(text), NOT_TAKEN])
-        for text, version in ('x/', 'x'), ('1a//b', '1a/'), ('1a/b/c', '1a/b'):
+        for text, version in ('x/', 'x'), ('1a//b', '1a/'), ('1a/../c', '1a/..'):
             self.check([f'link {DATASETS}/{text}'], [*unparsed(version), INCOMPATIBLE],
                        SYSTEM | {MARKER: 'file'})
 
     def test_system(self):
         for text, word in ((' \t\v\f\r\n2016f extra\n1a', '2016f'), ('1a.1', '1a.1'), (' \n', ''),
-                           (f'2016{10**5 * "f"}\v', f'2016{10**5 * "f"}'), ('\udcff', '\udcff')):
-            warnings = [] if word[:5] == '2016f' else 2 * unparsed(f'{word}.1.0')
-            self.check(['system', '2999a'], warnings, switch(f'{word}.1.0', '2999a'),
-                       {VERSION: f'file {text}'})
+                           (f'2016{50_000 * "f"}\v', f'2016{50_000 * "f"}'), ('\udcff', '\udcff')):
+            bad = [] if word[:5] == '2016f' else unparsed(f'{word}.1.0')
+            self.check([None, '2999a'], [*bad, 'Bad zoneinfo link ', BAD_LINKS, *bad, *bad],
+                       switch(f'{word}.1.0', '2999a'), {VERSION: f'file {text}'})
         self.check([], [NO_DATA], besides={VERSION: 'file 2147483648a'}, status=1)
 
 
@@ -107,7 +106,7 @@ class IcuData(StartTest):
 
     def test_format(self):
         for text in '44l', '044l', '9e', 17 * '2' + 'b':
-            self.check_format(True, f'file \t{text}\nmore', f'icutz{text}.dat')
+            self.check_format(True, f'file \t{text}\r\nmore', f'icutz{text}.dat')
         for text in '44lx', '44L', '4l', '44', '':
             self.check_format(False, f'file {text}', 'icutz44l.dat')
 
@@ -143,18 +142,18 @@ class LocalTime(StartTest):
             self.check(['system', None, f'link {ZONEINFO}{rest}'])
 
     def test_corrected(self):
-        for rest in '/Asia/Tokyo', '//Asia/Tokyo', '/', '':
+        for rest in '//Asia/../Asia/Tokyo', '/', '':
             self.check(['system', None, f'link {READ_ONLY}{rest}'],
                        [f'Correcting localtime link to {ZONEINFO}{rest}'],
                        {LOCALTIME: f'link {ZONEINFO}{rest}'})
 
     def test_reset(self):
-        for rest in '.default/Asia/Tokyo', '/posix', '/Asia/Tokyo/', '/Gone':
+        for rest in '.default/Asia/Tokyo', '/Asia/Tokyo/', '/Gone', f'/%d{255 * "x"}':
             correcting = f'Correcting localtime link to {ZONEINFO}{rest}'
             self.check(['system', None, f'link {READ_ONLY}{rest}'], [correcting, ZONE_RESET],
                        DEFAULT_ZONE, {f'{SYSTEM_ZONEINFO}/Gone': 'link nowhere'})
         for text in ('../zoneinfo/x', f'{TZ}/zoneinf', '/usr/share/zoneinfX/x',
-                     f'/x{READ_ONLY}/x', f'/x{ZONEINFO}', f'{DATASETS}/1a/x'):
+                     f'/x{READ_ONLY}/x', f'/x{ZONEINFO}', DATASETS):
             self.check(['system', None, f'link {text}'], [ZONE_RESET], DEFAULT_ZONE)
         warnings = [f'read_symlink: {LOCALTIME}', f'{ZONE_RESET}: Invalid argument']
         self.check(['system', None, 'directory'], warnings, DEFAULT_ZONE)
@@ -185,6 +184,7 @@ class Failures(StartTest):
                    SWITCH | DEFAULT_ZONE | {RECORD: 'file'},
                    {f'{MARKER}/entry': 'file', '/var/db/icu/entry': 'file'},
                    before=['sh', '-c', 'ulimit -f 0; "$0" "$@"'])
+        self.check(['system', '2016g.1.0'], [], links_to('2016g.1.0'), {RECORD: 'directory'})
 
     def test_standard_error(self):
         modes = {MARKER: '0o100666', RECORD: '0o100666 2016f.1.0_2016g.1.0'}
@@ -227,7 +227,7 @@ class Traces(StartTest):
         create = f'create_symlink: from {LOCALTIME} to {ZONEINFO}'
         self.check(['system', None, f'link {READ_ONLY}'],
                    [f'Correcting localtime link to {ZONEINFO}', create, ZONE_RESET,
-                    f'{create}/America/Los_Angeles: Input/output error'],
+                    f'{create}/America/Los_Angeles'],
                    {LOCALTIME: None}, status=1, before=disturb('symlink', LOCALTIME, 'error=EIO'))
 
     def test_caveats(self):
