@@ -44,7 +44,7 @@ source = pathlib.Path('/usr/share/zoneinfo/tzdata.zi').read_text()
 first = (re.match('# version ([0-9]{4}[a-z]+)', source) or sys.exit('tzdata.zi has no version'))[1]
 year = int(first[:4]) + 1
 update = f'{DATASETS}/{year}a.1.0'
-# The zone's last line holds until 2025; another follows, without a change of the offset.
+# The zone's last line holds until 2025; another follows, at -7 all year.
 invented = re.sub(r'(?m)^Z America/Los_Angeles .*(\n-?\d.*)*', r'\g<0> 2025\n-7 - PDT', source)
 
 device = Device('build', 'demo', ['build/release/mira_tzlinks'], ['date'])

@@ -142,7 +142,7 @@ class LocalTime(StartTest):
             self.check(['system', None, f'link {ZONEINFO}{rest}'])
 
     def test_corrected(self):
-        for rest in '//Asia/../Asia/Tokyo', '/', '':
+        for rest in '/Asia/Tokyo', '/Asia/..//', '':
             self.check(['system', None, f'link {READ_ONLY}{rest}'],
                        [f'Correcting localtime link to {ZONEINFO}{rest}'],
                        {LOCALTIME: f'link {ZONEINFO}{rest}'})
