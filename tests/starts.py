@@ -112,7 +112,7 @@ class IcuData(StartTest):
 
     def test_no_format(self):
         self.check_format(False, 'file junk', 'icutz44x.dat')
-        for name in '''44L.dat 44x.dat l.dat 44.dat 44l.dat.bak 44l.DAT 44lxdat :l.dat 4\udcb2l.dat
+        for name in '''44L.dat 44|.dat l.dat 44.dat 44l.dat.bak 44l.DAT 44lxdat :l.dat 4\udcb2l.dat
                 44l 44le.dat /l.dat /icutz44l.dat'''.split():
             self.check_format(True, None, f'icutz{name}')  # none, as the system
         self.check_format(True, None, 'xicutz44l.dat')
@@ -129,7 +129,7 @@ class IcuData(StartTest):
         device.lay_out('system', '2016g.1.0')
         icu = f'{DATASETS}/icu'
         for number in range(30, 60):
-            device.put({f'{icu}/icutz{number}e.dat': 'file', f'{icu}/{number}/icutz9e.dat': 'file'})
+            device.put({f'{icu}/icutz{number}e.dat': 'file', f'{icu}/{number}': 'file'})
         first = next(name for name in os.listdir(device.outside(icu)) if 'icutz' in name)
         device.put({f'{DATASETS}/2016g.1.0/icutz': 'link ../icu', FORMAT: f'file {first[5:8]}'})
         os.utime(device.outside(icu), (2**31, 2**31))  # past a 32-bit long
@@ -142,7 +142,7 @@ class LocalTime(StartTest):
             self.check(['system', None, f'link {ZONEINFO}{rest}'])
 
     def test_corrected(self):
-        for rest in '/Asia/Tokyo', '/Asia/..//', '':
+        for rest in '/Asia/Tokyo', f'/Asia/..{255 * "/"}', '':
             self.check(['system', None, f'link {READ_ONLY}{rest}'],
                        [f'Correcting localtime link to {ZONEINFO}{rest}'],
                        {LOCALTIME: f'link {ZONEINFO}{rest}'})
